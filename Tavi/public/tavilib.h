@@ -1,0 +1,153 @@
+#ifndef TAVI_PUBLIC_TAVILIB_H_
+#define TAVI_PUBLIC_TAVILIB_H_
+
+// tavilib finds human faces in an image (detect) and places 68 facial
+// landmarks on a face rectangle (align68Points, align5Points).
+//
+// Threads: a Detector serves one thread at a time, since detect rewrites the
+// state of its networks; different Detector objects may detect at once. Loads
+// of different Detector objects are serialised internally. The alignment model
+// is one per process: any number of alignments may run at once on a loaded
+// model, but loadSDMModel and unloadSDMModel must not overlap them, and nothing
+// guards this.
+//
+// Errors: the functions return a Status. A missing or malformed network file
+// ends the process through the fatal logging of the network engine; check the
+// model folder before loading if that is not acceptable. Exceptions of the
+// image library (an empty image, a null buffer) and of allocation pass through
+// to the caller.
+
+#include <cstdint>
+#include <string>
+#include <vector>
+
+#if defined(_WIN32)
+#define TAVI_EXPORT __declspec(dllexport)
+#else
+#define TAVI_EXPORT __attribute__((visibility("default")))
+#endif
+
+namespace tavilib {
+
+// The only values an exported function returns.
+enum Status : int32_t {
+  STATUS_OK = 0,
+  // No cascade stage was loaded, the calibration net is missing, or the
+  // alignment model file was refused.
+  STATUS_MODEL_LOAD_FAILED = -3,
+  // The Detector holds a state whose load did not complete.
+  STATUS_DETECTOR_NOT_READY = -6,
+};
+
+// A decoded image, borrowed for the length of one call. Pixels are three
+// interleaved 8-bit samples in the order blue, green, red; rows run from the
+// top down. stride is the distance in bytes between rows, 0 for tightly packed
+// rows (width * 3). detect honours stride; the alignment functions always
+// assume tightly packed rows.
+struct Image {
+  int32_t width;
+  int32_t height;
+  int32_t stride;
+  unsigned char* data;
+};
+
+// Edges in pixels of the image passed in; right and bottom are exclusive.
+template <typename T>
+struct Rectangle {
+  T left;
+  T top;
+  T right;
+  T bottom;
+};
+
+class Detection {
+ public:
+  Rectangle<float> box;
+  // Face probability from the last cascade stage, between 0 and 1.
+  float score;
+};
+
+// Scan settings of one detect call; the host sets all six fields.
+class CascadeParameter {
+ public:
+  // Largest factor by which an image smaller than normalizedSize is enlarged.
+  float maxUpscale;
+  // Length in pixels to which the longer image edge is normalised.
+  int32_t normalizedSize;
+  // Smallest face sought, as a fraction of normalizedSize.
+  float minFaceRatio;
+  // Most pyramid levels scanned.
+  int32_t numScales;
+  // Ratio between neighbouring pyramid levels, above 1.
+  float scaleStep;
+  // Side in pixels of a pyramid level of the window one output cell of the
+  // first network stands for.
+  int32_t windowSize;
+};
+
+// Where a cascade model folder lies. Both pointers are borrowed, not copied:
+// the strings must outlive the load call.
+struct TAVI_EXPORT DetectorParams {
+  // Both strings empty.
+  DetectorParams();
+  DetectorParams(const DetectorParams& other);
+  DetectorParams(const char* const& cascadeRoot, const char* const& cascadeList);
+  ~DetectorParams();
+  DetectorParams& operator=(const DetectorParams& other);
+
+  // Prefix of every cascade file, used as a plain string: it must end in a
+  // path separator.
+  const char* cascadeRoot;
+  // Name of the list file, relative to cascadeRoot.
+  const char* cascadeList;
+  // Set to 1; read by nothing.
+  int32_t reserved;
+};
+
+class DetectorState;
+
+// A loaded face-detection cascade.
+//
+// Copy assignment shares the state without counting owners: each copy deletes
+// it on unload or destruction, so two copies must not both go out of scope.
+class TAVI_EXPORT Detector {
+ public:
+  Detector();
+  ~Detector();
+  Detector& operator=(const Detector& other);
+
+  // Loads the built-in cascade; its weight files are looked up relative to the
+  // working directory. Any earlier state is released first, also when the new
+  // load then fails.
+  Status load();
+  // Loads the cascade named by the list file of a model folder.
+  Status load(const DetectorParams& params);
+  // Releases the state; harmless when nothing is loaded.
+  void unload();
+  // True whenever a state object exists, also after a failed load: the Status
+  // of load, not this, tells whether detect can run.
+  bool is_loaded() const;
+  // The state, opaque to the host.
+  const void* getDetector() const;
+
+ private:
+  DetectorState* detector_;
+};
+
+TAVI_EXPORT Status loadDetector(Detector& detector);
+TAVI_EXPORT Status loadDetector(Detector& detector, const DetectorParams& params);
+TAVI_EXPORT void unloadDetector(Detector& detector);
+
+// Finds faces and appends them to detections, best score first; what the
+// vector held before stays in front.
+// REQUIRES: detector has been loaded (is_loaded() is true); after a failed load
+//   this returns STATUS_DETECTOR_NOT_READY and leaves detections as they were.
+// REQUIRES: params make the base image fit the first network's declared input
+//   (roughly windowSize / minFaceRatio at most 384 for the built-in cascade).
+// REQUIRES: no other thread uses the same Detector during the call.
+TAVI_EXPORT Status detect(const Image& image, const Detector& detector,
+                          std::vector<Detection>& detections, const CascadeParameter& params);
+
+}  // namespace tavilib
+
+#endif  // TAVI_PUBLIC_TAVILIB_H_

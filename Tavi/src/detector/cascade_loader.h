@@ -1,0 +1,17 @@
+#ifndef TAVI_SRC_DETECTOR_CASCADE_LOADER_H_
+#define TAVI_SRC_DETECTOR_CASCADE_LOADER_H_
+
+#include "detector/detector_state.h"
+#include "tavilib.h"
+
+namespace tavilib {
+
+// Fill a fresh state with the stages and the calibration net, from the model
+// folder named by params or from the built-in tables. Both hold the
+// process-wide load lock while they build nets.
+Status loadCascadeFromFolder(DetectorState& state, const DetectorParams& params);
+Status loadBuiltInCascade(DetectorState& state);
+
+}  // namespace tavilib
+
+#endif  // TAVI_SRC_DETECTOR_CASCADE_LOADER_H_

@@ -1,0 +1,13 @@
+#include "detector/cascade_driver.h"
+#include "tavilib.h"
+
+namespace tavilib {
+
+Status detect(const Image& image, const Detector& detector, std::vector<Detection>& detections,
+              const CascadeParameter& params) {
+  // detect is const on the Detector, yet it runs (and so changes) its nets.
+  auto* state = static_cast<DetectorState*>(const_cast<void*>(detector.getDetector()));
+  return runCascade(image, *state, detections, params, CascadeSteps());
+}
+
+}  // namespace tavilib

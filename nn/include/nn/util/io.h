@@ -1,0 +1,39 @@
+#ifndef NN_UTIL_IO_H_
+#define NN_UTIL_IO_H_
+
+#include <google/protobuf/message.h>
+
+#include <string>
+
+#include "nn/proto/nn.pb.h"
+
+namespace nn {
+
+using google::protobuf::Message;
+
+// The weight-file reader refuses messages above this size...
+constexpr int kProtoReadBytesLimit = 1073741824;
+// ...and warns from this size on.
+constexpr int kProtoReadBytesWarningThreshold = 536870912;
+
+// Each reader returns whether the message parsed. A file that cannot be opened
+// does not return: the check "fd != -1" ends the process with
+// "File not found: " and the name.
+bool ReadProtoFromTextFile(const char* filename, Message* proto);
+inline bool ReadProtoFromTextFile(const std::string& filename, Message* proto) {
+  return ReadProtoFromTextFile(filename.c_str(), proto);
+}
+// Parses a text-format message held in memory.
+bool ReadProtoFromTextFile1(const std::string& text, Message* proto);
+bool ReadProtoFromBinaryFile(const char* filename, Message* proto);
+
+// These return only with a usable message, upgraded from the old description
+// generation where needed; a file that fails to parse ends the process.
+void ReadNetParamsFromTextFile(const std::string& param_file, NetParameter* param);
+// Here param_file holds the description text itself.
+void ReadNetParamsFromText(const std::string& param_file, NetParameter* param);
+void ReadNetParamsFromBinaryFile(const std::string& param_file, NetParameter* param);
+
+}  // namespace nn
+
+#endif  // NN_UTIL_IO_H_

@@ -1,0 +1,112 @@
+#include "nn/util/io.h"
+
+#include <fcntl.h>
+#include <glog/logging.h>
+#include <google/protobuf/io/coded_stream.h>
+#include <google/protobuf/io/zero_copy_stream_impl.h>
+#include <google/protobuf/io/zero_copy_stream_impl_lite.h>
+#include <google/protobuf/text_format.h>
+#include <sys/stat.h>
+#include <unistd.h>
+
+#include <fstream>
+#include <memory>
+
+#include "nn/util/upgrade_proto.h"
+
+namespace nn {
+
+using google::protobuf::io::ArrayInputStream;
+using google::protobuf::io::CodedInputStream;
+using google::protobuf::io::FileInputStream;
+
+bool ReadProtoFromTextFile(const char* filename, Message* proto) {
+  int fd = open(filename, O_RDONLY);
+  CHECK_NE(fd, -1) << "File not found: " << filename;
+  // Holds the descriptor for the duration of the read; the text itself comes
+  // through the line reader below.
+  std::unique_ptr<FileInputStream> input(new FileInputStream(fd));
+  std::string text;
+  {
+    std::ifstream lines(filename);
+    std::string line;
+    // The test comes before the read, so the text gains one empty last line.
+    while (!lines.fail()) {
+      // A failed getline keeps the old contents; the last line must not
+      // come twice when the file does not end in a newline.
+      line.clear();
+      std::getline(lines, line);
+      text += line;
+      text += "\n";
+    }
+  }
+  const bool success = ReadProtoFromTextFile1(text, proto);
+  input.reset();
+  close(fd);
+  return success;
+}
+
+bool ReadProtoFromTextFile1(const std::string& text, Message* proto) {
+  ArrayInputStream input(text.data(), static_cast<int>(text.size()));
+  return google::protobuf::TextFormat::Parse(&input, proto);
+}
+
+bool ReadProtoFromBinaryFile(const char* filename, Message* proto) {
+  int fd = open(filename, O_RDONLY);
+  CHECK_NE(fd, -1) << "File not found: " << filename;
+  struct stat file_status;
+  if (fstat(fd, &file_status) == 0 && file_status.st_size >= kProtoReadBytesWarningThreshold) {
+    LOG(WARNING) << "Reading a large weight file (" << file_status.st_size << " bytes) from "
+                 << filename << "; files above " << kProtoReadBytesLimit
+                 << " bytes are refused.";
+  }
+  std::unique_ptr<FileInputStream> raw_input(new FileInputStream(fd));
+  std::unique_ptr<CodedInputStream> coded_input(new CodedInputStream(raw_input.get()));
+  coded_input->SetTotalBytesLimit(kProtoReadBytesLimit);
+  const bool success = proto->ParseFromCodedStream(coded_input.get());
+  coded_input.reset();
+  raw_input.reset();
+  close(fd);
+  return success;
+}
+
+namespace {
+
+void UpgradeNetAsNeeded(const std::string& param_file, const char* upgrade_tool,
+                        NetParameter* param) {
+  if (!NetParameterIsV0(*param)) {
+    return;
+  }
+  LOG(ERROR) << "Attempting to upgrade input file specified using deprecated "
+             << "V0LayerParameter: " << param_file;
+  const NetParameter original_param(*param);
+  if (!UpgradeV0Net(original_param, param)) {
+    LOG(ERROR) << "Warning: had one or more problems upgrading "
+               << "V0NetParameter to NetParameter (see above); continuing anyway.";
+  }
+  LOG(ERROR) << "Note that future releases will not support "
+             << "V0NetParameter; use ./build/tools/" << upgrade_tool << " to "
+             << "upgrade this and any other network proto files to the new format.";
+}
+
+}  // namespace
+
+void ReadNetParamsFromTextFile(const std::string& param_file, NetParameter* param) {
+  CHECK(ReadProtoFromTextFile(param_file, param))
+      << "Failed to parse NetParameter file: " << param_file;
+  UpgradeNetAsNeeded(param_file, "upgrade_net_proto_text.bin", param);
+}
+
+void ReadNetParamsFromText(const std::string& param_file, NetParameter* param) {
+  CHECK(ReadProtoFromTextFile1(param_file, param))
+      << "Failed to parse NetParameter file: " << param_file;
+  UpgradeNetAsNeeded(param_file, "upgrade_net_proto_text.bin", param);
+}
+
+void ReadNetParamsFromBinaryFile(const std::string& param_file, NetParameter* param) {
+  CHECK(ReadProtoFromBinaryFile(param_file.c_str(), param))
+      << "Failed to parse NetParameter file: " << param_file;
+  UpgradeNetAsNeeded(param_file, "upgrade_net_proto_binary.bin", param);
+}
+
+}  // namespace nn
