@@ -27,6 +27,11 @@ inline bool ReadProtoFromTextFile(const std::string& filename, Message* proto) {
 bool ReadProtoFromTextFile1(const std::string& text, Message* proto);
 bool ReadProtoFromBinaryFile(const char* filename, Message* proto);
 
+// Each writer replaces the file with the message, in the text or the binary
+// format, and returns whether all of it was written.
+bool WriteProtoToTextFile(const Message& proto, const std::string& filename);
+bool WriteProtoToBinaryFile(const Message& proto, const std::string& filename);
+
 // These return only with a usable message, upgraded from the old description
 // generation where needed; a file that fails to parse ends the process.
 void ReadNetParamsFromTextFile(const std::string& param_file, NetParameter* param);

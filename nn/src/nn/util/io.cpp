@@ -19,6 +19,7 @@ namespace nn {
 using google::protobuf::io::ArrayInputStream;
 using google::protobuf::io::CodedInputStream;
 using google::protobuf::io::FileInputStream;
+using google::protobuf::io::OstreamOutputStream;
 
 bool ReadProtoFromTextFile(const char* filename, Message* proto) {
   int fd = open(filename, O_RDONLY);
@@ -68,6 +69,25 @@ bool ReadProtoFromBinaryFile(const char* filename, Message* proto) {
   raw_input.reset();
   close(fd);
   return success;
+}
+
+bool WriteProtoToTextFile(const Message& proto, const std::string& filename) {
+  std::ofstream file(filename, std::ios::binary | std::ios::trunc);
+  bool printed = false;
+  {
+    // The stream flushes into the file when it goes.
+    OstreamOutputStream output(&file);
+    printed = google::protobuf::TextFormat::Print(proto, &output);
+  }
+  file.close();
+  return printed && !file.fail();
+}
+
+bool WriteProtoToBinaryFile(const Message& proto, const std::string& filename) {
+  std::ofstream file(filename, std::ios::binary | std::ios::trunc);
+  const bool serialized = proto.SerializeToOstream(&file);
+  file.close();
+  return serialized && !file.fail();
 }
 
 namespace {

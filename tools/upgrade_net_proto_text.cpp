@@ -1,0 +1,6 @@
+// Upgrades a network text description to the current generation.
+#include "upgrade_net_proto.h"
+
+int main(int argc, char** argv) {
+  return tools::UpgradeNetProtoMain(argc, argv, tools::NetProtoForm::kText);
+}
