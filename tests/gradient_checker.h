@@ -1,5 +1,5 @@
-#ifndef TESTS_NN_GRADIENT_CHECKER_H_
-#define TESTS_NN_GRADIENT_CHECKER_H_
+#ifndef TESTS_GRADIENT_CHECKER_H_
+#define TESTS_GRADIENT_CHECKER_H_
 
 #include <gtest/gtest.h>
 
@@ -92,4 +92,4 @@ class GradientChecker {
 
 }  // namespace nn
 
-#endif  // TESTS_NN_GRADIENT_CHECKER_H_
+#endif  // TESTS_GRADIENT_CHECKER_H_
