@@ -1,0 +1,192 @@
+#include "alignment/sdm_regression.h"
+
+#include <algorithm>
+#include <cstdint>
+
+#include <opencv2/imgproc.hpp>
+
+#include "alignment/sift_pyramid.h"
+#include "nn/util/math_functions.h"
+
+namespace SDMCore {
+
+void GeneralUnit::normalize(int width) { normalizeImage(width); }
+
+void GeneralUnit::normalizeImage(int width) {
+  scale = static_cast<float>(width) / static_cast<float>(faceRect.width);
+  const cv::Size size(static_cast<int>(static_cast<float>(image.cols) * scale),
+                      static_cast<int>(static_cast<float>(image.rows) * scale));
+  // The size is given, so the factors beside it play no part.
+  cv::resize(image, image, size, 0, 0, cv::INTER_LINEAR);
+  for (float& v : referenceShape) v *= scale;
+  for (float& v : resultShape) v *= scale;
+  scaleFaceRect();
+}
+
+void GeneralUnit::scaleFaceRect() {
+  faceRect.x = static_cast<int>(static_cast<float>(faceRect.x) * scale);
+  faceRect.y = static_cast<int>(static_cast<float>(faceRect.y) * scale);
+  faceRect.width = static_cast<int>(static_cast<float>(faceRect.width) * scale);
+  faceRect.height = static_cast<int>(static_cast<float>(faceRect.height) * scale);
+}
+
+void GeneralUnit::restoreShapes() {
+  for (float& v : referenceShape) v /= scale;
+  for (float& v : resultShape) v /= scale;
+}
+
+std::vector<float> placeShape(const std::vector<float>& unitShape, const cv::Rect& faceRect) {
+  std::vector<float> shape(unitShape.size());
+  const float width = static_cast<float>(faceRect.width);
+  const float height = static_cast<float>(faceRect.height);
+  const float x0 = static_cast<float>(faceRect.x);
+  const float y0 = static_cast<float>(faceRect.y);
+  for (size_t i = 0; i + 1 < unitShape.size(); i += 2) {
+    shape[i] = width * unitShape[i] + x0;
+    shape[i + 1] = height * unitShape[i + 1] + y0;
+  }
+  return shape;
+}
+
+std::vector<std::vector<float>> startShapes(const std::vector<float>& meanShape,
+                                            const cv::Rect& faceRect) {
+  std::vector<std::vector<float>> starts;
+  starts.push_back(placeShape(meanShape, faceRect));
+  for (int e = 0; e < 1; ++e) {
+    const float f = static_cast<float>(e) * 0.05f + 1.0f;
+    for (int a = -1; a <= 1; ++a) {
+      for (int b = -1; b <= 1; ++b) {
+        if (a == 0 && b == 0) continue;
+        std::vector<float> moved(meanShape.size());
+        for (size_t i = 0; i + 1 < meanShape.size(); i += 2) {
+          moved[i] = (meanShape[i] - 0.5f) * f + 0.5f + static_cast<float>(a) * 0.1f;
+          moved[i + 1] = (meanShape[i + 1] - 0.5f) * f + 0.5f + static_cast<float>(b) * 0.1f;
+        }
+        starts.push_back(placeShape(moved, faceRect));
+      }
+    }
+  }
+  return starts;
+}
+
+int padForShape(const cv::Mat& image, const std::vector<float>& shape, cv::Mat& padded) {
+  const int columns = image.cols;
+  const int rows = image.rows;
+  int pad = static_cast<int>(static_cast<double>(columns) * 0.4);
+  for (size_t i = 0; i + 1 < shape.size(); i += 2) {
+    const float x = shape[i];
+    const float y = shape[i + 1];
+    float need = 0.0f;
+    if (x < 0.0f || y < 0.0f) {
+      need = std::max(-x, -y);
+    } else if (x >= static_cast<float>(columns) || y >= static_cast<float>(rows)) {
+      need = std::max(x - static_cast<float>(columns) + 1.0f, y - static_cast<float>(rows) + 1.0f);
+    } else {
+      continue;
+    }
+    pad = std::max(pad, static_cast<int>(need));
+  }
+  if (pad < 1) {
+    padded = image;
+  } else {
+    cv::copyMakeBorder(image, padded, pad, pad, pad, pad, cv::BORDER_CONSTANT, cv::Scalar(0));
+  }
+  return pad;
+}
+
+void applyStage(const float* feature, const mp::pca_map& map, const mp::matrix& bias,
+                std::vector<float>& shape) {
+  const int D = map.mean.columns();
+  const int K = map.projection.columns();
+  std::vector<float> tmp(std::max(D, 0));
+  nn::vsSub(D, feature, map.mean.data(), tmp.data());
+  std::vector<float> delta(std::max<size_t>(shape.size(), static_cast<size_t>(std::max(K, 0))), 0.0f);
+  // An empty map leaves delta at zero, which the product would give too.
+  if (D > 0 && K > 0) {
+    cblas_sgemm(CblasRowMajor, CblasNoTrans, CblasNoTrans, 1, K, D, 1.0f, tmp.data(), D,
+                map.projection.data(), K, 0.0f, delta.data(), K);
+  }
+  const bool withBias =
+      bias.data() != nullptr && bias.size() == static_cast<int64_t>(shape.size());
+  for (size_t q = 0; q < shape.size(); ++q) {
+    if (withBias) {
+      shape[q] += bias.data()[q] + delta[q];
+    } else {
+      shape[q] += delta[q];
+    }
+  }
+}
+
+std::vector<float> coordinateMedian(const std::vector<std::vector<float>>& shapes) {
+  std::vector<float> result = shapes.at(0);
+  std::vector<float> values(shapes.size());
+  for (size_t q = 0; q < result.size(); ++q) {
+    for (size_t s = 0; s < shapes.size(); ++s) values[s] = shapes[s][q];
+    std::sort(values.begin(), values.end());
+    result[q] = values[values.size() / 2];
+  }
+  return result;
+}
+
+std::vector<float> regressShapes(const SDMModel& model, const cv::Mat& image,
+                                 const std::vector<std::vector<float>>& starts) {
+  cv::Mat padded;
+  const int pad = padForShape(image, starts.at(0), padded);
+  if (!padded.isContinuous()) padded = padded.clone();
+  const float padding = static_cast<float>(pad);
+
+  const uint64_t S = static_cast<uint64_t>(model.scalesPerOctave);
+  SiftPyramid pyramid(static_cast<uint64_t>(padded.cols), static_cast<uint64_t>(padded.rows), S);
+  pyramid.buildBase(static_cast<uint64_t>(padded.cols), static_cast<uint64_t>(padded.rows),
+                    padded.ptr<uint8_t>(0));
+  pyramid.buildLevels();
+
+  const size_t points = model.meanShape.size() / 2;
+  std::vector<float> feature(points * 128);
+  // One buffer for every descriptor of the face: a point whose descriptor is
+  // left unchanged repeats the bytes of the one before it.
+  uint8_t descriptor[128] = {};
+  const mp::matrix noBias;
+  const bool useBiases = !model.stageMatrices.empty() && !model.stageBiases.empty();
+
+  std::vector<std::vector<float>> shapes = starts;
+  for (std::vector<float>& shape : shapes) {
+    for (float& v : shape) v += padding;
+    for (size_t i = 0; i < model.stageMaps.size(); ++i) {
+      // Stages past the list use its last entry (level 0 if the list is empty).
+      int32_t level = 0;
+      if (i < model.stageLevels.size()) {
+        level = model.stageLevels[i];
+      } else if (!model.stageLevels.empty()) {
+        level = model.stageLevels.back();
+      }
+      for (size_t j = 0; j < points; ++j) {
+        float norm = 0.0f;
+        pyramid.computeDescriptor(shape[2 * j], shape[2 * j + 1], static_cast<float>(level), norm,
+                                  descriptor);
+        float* row = feature.data() + j * 128;
+        for (int t = 0; t < 128; ++t) row[t] = static_cast<float>(descriptor[t]) * 0.00390625f;
+      }
+      const mp::matrix& bias =
+          useBiases && i < model.stageBiases.size() ? model.stageBiases[i] : noBias;
+      applyStage(feature.data(), model.stageMaps[i], bias, shape);
+    }
+  }
+
+  std::vector<float> result = coordinateMedian(shapes);
+  for (float& v : result) v -= padding;
+  return result;
+}
+
+std::vector<float> fitFace(const SDMModel& model, GeneralUnit& unit) {
+  unit.normalize(model.faceWidth);
+  const std::vector<std::vector<float>> starts = startShapes(model.meanShape, unit.faceRect);
+  // referenceShape stays beside the result; the regression takes no notice of it.
+  unit.resultShape = regressShapes(model, unit.image, starts);
+  unit.restoreShapes();
+  return unit.resultShape;
+}
+
+std::vector<float> fitFace(GeneralUnit& unit) { return fitFace(*sdmModel, unit); }
+
+}  // namespace SDMCore
