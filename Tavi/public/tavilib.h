@@ -148,6 +148,25 @@ TAVI_EXPORT void unloadDetector(Detector& detector);
 TAVI_EXPORT Status detect(const Image& image, const Detector& detector,
                           std::vector<Detection>& detections, const CascadeParameter& params);
 
+// Loads the alignment model from the file folder + "/" + file, replacing any
+// model loaded before (which is dropped even if this load then fails).
+// REQUIRES: no alignment runs during the call.
+TAVI_EXPORT Status loadSDMModel(const std::string& folder, const std::string& file);
+// Releases the alignment model; STATUS_OK also when none is loaded.
+// REQUIRES: no alignment runs during the call.
+TAVI_EXPORT Status unloadSDMModel();
+// Replaces the contents of points by 68 landmarks as 136 floats, interleaved
+// x and y, in pixels of image.
+// REQUIRES: a model was loaded with STATUS_OK; image rows are tightly packed
+//   (stride is ignored).
+TAVI_EXPORT Status align68Points(const Image& image, const Rectangle<float>& rect,
+                                 std::vector<float>& points);
+// Replaces the contents of points by five landmarks as 10 floats: the centres
+// of the right and left eye, the nose tip, the right and left mouth corner.
+// REQUIRES: as align68Points.
+TAVI_EXPORT Status align5Points(const Image& image, const Rectangle<float>& rect,
+                                std::vector<float>& points);
+
 }  // namespace tavilib
 
 #endif  // TAVI_PUBLIC_TAVILIB_H_

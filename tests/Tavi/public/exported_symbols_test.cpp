@@ -43,6 +43,14 @@ TEST(ExportedSymbolsTest, OnlyTheTavilibInterfaceLeavesTheLibrary) {
   EXPECT_THAT(names, testing::Contains("tavilib::Detector::getDetector() const"));
   EXPECT_THAT(names, testing::Contains("tavilib::DetectorParams::DetectorParams(char const* const&, "
                                        "char const* const&)"));
+  EXPECT_THAT(names, testing::Contains(testing::StartsWith("tavilib::loadSDMModel(std::")));
+  EXPECT_THAT(names, testing::Contains("tavilib::unloadSDMModel()"));
+  EXPECT_THAT(names, testing::Contains(testing::StartsWith(
+                         "tavilib::align68Points(tavilib::Image const&, "
+                         "tavilib::Rectangle<float> const&, std::vector<float")));
+  EXPECT_THAT(names, testing::Contains(testing::StartsWith(
+                         "tavilib::align5Points(tavilib::Image const&, "
+                         "tavilib::Rectangle<float> const&, std::vector<float")));
 }
 
 }  // namespace
