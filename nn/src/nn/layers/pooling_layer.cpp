@@ -81,11 +81,9 @@ Dtype PoolingLayer<Dtype>::Forward_cpu(const std::vector<Blob<Dtype>*>& bottom,
                                        std::vector<Blob<Dtype>*>* top) {
   const Dtype* bottom_data = bottom[0]->cpu_data();
   Dtype* top_data = (*top)[0]->mutable_cpu_data();
-  const int top_count = (*top)[0]->count();
   const int images = bottom[0]->num();
   switch (this->layer_param_.pooling_param().pool()) {
     case PoolingParameter_PoolMethod_MAX:
-      std::fill(top_data, top_data + top_count, std::numeric_limits<Dtype>::lowest());
       for (int n = 0; n < images; ++n) {
         for (int c = 0; c < channels_; ++c) {
           for (int ph = 0; ph < pooled_height_; ++ph) {
@@ -94,15 +92,16 @@ Dtype PoolingLayer<Dtype>::Forward_cpu(const std::vector<Blob<Dtype>*>& bottom,
             for (int pw = 0; pw < pooled_width_; ++pw) {
               const int wstart = pw * stride_;
               const int wend = std::min(wstart + kernel_size_, width_);
-              Dtype& out = top_data[ph * pooled_width_ + pw];
+              // A window wholly outside the image keeps the lowest float.
+              Dtype out = std::numeric_limits<Dtype>::lowest();
               for (int h = hstart; h < hend; ++h) {
+                const Dtype* row = bottom_data + h * width_;
                 for (int w = wstart; w < wend; ++w) {
                   // Strictly greater: a NaN never enters.
-                  if (bottom_data[h * width_ + w] > out) {
-                    out = bottom_data[h * width_ + w];
-                  }
+                  out = row[w] > out ? row[w] : out;
                 }
               }
+              top_data[ph * pooled_width_ + pw] = out;
             }
           }
           bottom_data += height_ * width_;
@@ -111,7 +110,7 @@ Dtype PoolingLayer<Dtype>::Forward_cpu(const std::vector<Blob<Dtype>*>& bottom,
       }
       break;
     case PoolingParameter_PoolMethod_AVE:
-      std::fill(top_data, top_data + top_count, Dtype(0));
+      std::fill(top_data, top_data + (*top)[0]->count(), Dtype(0));
       for (int n = 0; n < images; ++n) {
         for (int c = 0; c < channels_; ++c) {
           for (int ph = 0; ph < pooled_height_; ++ph) {

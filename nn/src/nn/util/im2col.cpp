@@ -28,32 +28,35 @@ void im2col(const float* data_im, int channels, int height, int width, int ksize
             int stride, float* data_col) {
   const int height_col = OutputSize(height, ksize, pad, stride);
   const int width_col = OutputSize(width, ksize, pad, stride);
-  const int channels_col = channels * ksize * ksize;
-  for (int c = 0; c < channels_col; ++c) {
-    const int w_offset = c % ksize;
-    const int h_offset = (c / ksize) % ksize;
-    const int c_im = c / ksize / ksize;
-    int first = 0;
-    int last = 0;
-    InsideColumns(width, width_col, pad, stride, w_offset, &first, &last);
-    for (int h = 0; h < height_col; ++h) {
-      float* out = data_col + (c * height_col + h) * width_col;
-      const int h_pad = h * stride - pad + h_offset;
-      if (h_pad < 0 || h_pad >= height) {
-        std::fill(out, out + width_col, 0.0f);
-        continue;
-      }
-      const float* row = data_im + (c_im * height + h_pad) * width;
-      const int shift = w_offset - pad;
-      std::fill(out, out + first, 0.0f);
-      if (stride == 1) {
-        std::memcpy(out + first, row + first + shift, sizeof(float) * (last - first));
-      } else {
-        for (int w = first; w < last; ++w) {
-          out[w] = row[w * stride + shift];
+  // Row by row of the image, all kernel columns at once, so that each input
+  // row is read from the cache ksize times rather than from memory.
+  for (int c_im = 0; c_im < channels; ++c_im) {
+    for (int h_offset = 0; h_offset < ksize; ++h_offset) {
+      for (int h = 0; h < height_col; ++h) {
+        const int h_pad = h * stride - pad + h_offset;
+        const float* row = data_im + (c_im * height + h_pad) * width;
+        for (int w_offset = 0; w_offset < ksize; ++w_offset) {
+          const int c = (c_im * ksize + h_offset) * ksize + w_offset;
+          float* out = data_col + (c * height_col + h) * width_col;
+          if (h_pad < 0 || h_pad >= height) {
+            std::fill(out, out + width_col, 0.0f);
+            continue;
+          }
+          int first = 0;
+          int last = 0;
+          InsideColumns(width, width_col, pad, stride, w_offset, &first, &last);
+          const int shift = w_offset - pad;
+          std::fill(out, out + first, 0.0f);
+          if (stride == 1) {
+            std::memcpy(out + first, row + first + shift, sizeof(float) * (last - first));
+          } else {
+            for (int w = first; w < last; ++w) {
+              out[w] = row[w * stride + shift];
+            }
+          }
+          std::fill(out + last, out + width_col, 0.0f);
         }
       }
-      std::fill(out + last, out + width_col, 0.0f);
     }
   }
 }
