@@ -9,6 +9,17 @@
 #include "nn/util/math_functions.h"
 
 namespace SDMCore {
+namespace {
+
+// The pyramid level of stage i: its entry of stageLevels, or the list's last
+// entry past its end (0 for an empty list).
+int32_t stageLevel(const SDMModel& model, size_t i) {
+  if (i < model.stageLevels.size()) return model.stageLevels[i];
+  if (!model.stageLevels.empty()) return model.stageLevels.back();
+  return 0;
+}
+
+}  // namespace
 
 void GeneralUnit::normalize(int width) { normalizeImage(width); }
 
@@ -139,7 +150,11 @@ std::vector<float> regressShapes(const SDMModel& model, const cv::Mat& image,
   SiftPyramid pyramid(static_cast<uint64_t>(padded.cols), static_cast<uint64_t>(padded.rows), S);
   pyramid.buildBase(static_cast<uint64_t>(padded.cols), static_cast<uint64_t>(padded.rows),
                     padded.ptr<uint8_t>(0));
-  pyramid.buildLevels();
+  // Only the levels some stage asks for are blurred; the others would not be
+  // read.
+  int32_t highest = 0;
+  for (size_t i = 0; i < model.stageMaps.size(); ++i) highest = std::max(highest, stageLevel(model, i));
+  pyramid.buildLevels(static_cast<uint64_t>(std::min<int64_t>(highest, static_cast<int64_t>(S) + 2)));
 
   const size_t points = model.meanShape.size() / 2;
   std::vector<float> feature(points * 128);
@@ -153,13 +168,7 @@ std::vector<float> regressShapes(const SDMModel& model, const cv::Mat& image,
   for (std::vector<float>& shape : shapes) {
     for (float& v : shape) v += padding;
     for (size_t i = 0; i < model.stageMaps.size(); ++i) {
-      // Stages past the list use its last entry (level 0 if the list is empty).
-      int32_t level = 0;
-      if (i < model.stageLevels.size()) {
-        level = model.stageLevels[i];
-      } else if (!model.stageLevels.empty()) {
-        level = model.stageLevels.back();
-      }
+      const int32_t level = stageLevel(model, i);
       for (size_t j = 0; j < points; ++j) {
         float norm = 0.0f;
         pyramid.computeDescriptor(shape[2 * j], shape[2 * j + 1], static_cast<float>(level), norm,

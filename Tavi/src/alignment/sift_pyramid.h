@@ -73,6 +73,9 @@ class SiftPyramid {
   // pixels: 8-bit grey, stride = width, the size given to the constructor.
   void buildBase(uint64_t width, uint64_t height, const uint8_t* pixels);
   void buildLevels();
+  // Builds levels 1 .. highest only (each level depends on the ones below);
+  // the others keep what they held. For a caller that knows it needs no more.
+  void buildLevels(uint64_t highest);
 
   // The descriptor of the point (x, y) at level (a whole number in 0 .. S + 2)
   // into out, and norm = the histogram's length before normalisation. When
@@ -100,7 +103,6 @@ class SiftPyramid {
   static constexpr float kBinSigmas = 4.0f;
   static constexpr float kClampValue = 0.2f;
 
- private:
   // A gradient cell as the histogram uses it: the main bin's weighted
   // magnitude and the ratio of the second bin's weight to the main one's, both
   // computed once per pixel. 16 bytes, one aligned load.
@@ -113,6 +115,8 @@ class SiftPyramid {
   };
   static_assert(sizeof(SampleCell) == 16, "a sample cell is one 16-byte load");
 
+ private:
+
   uint64_t width_;
   uint64_t height_;
   uint64_t octaves_ = 1;
@@ -122,6 +126,10 @@ class SiftPyramid {
   // Gradient levels, width by height each, empty until first needed.
   std::vector<std::vector<SampleCell>> gradients_;
   float k_;
+  // Per-descriptor scratch, kept to spare the allocations.
+  std::vector<int64_t> scratchDx_;
+  std::vector<int> scratchColumn_;
+  std::vector<float> scratchAcross_;
 };
 
 }  // namespace SDMCore

@@ -79,18 +79,21 @@ void ReferenceDescriptor(const SiftPyramid& pyramid, float x, float y, float lev
       }
     }
   }
-  float sum = 0;
-  for (float v : h) sum += v * v;
-  const float total = std::sqrt(sum);
+  // The sum of squares in four interleaved partial sums, as the library adds
+  // them (the order of this sum is the implementer's choice).
+  auto sumOfSquares = [](const float* v) {
+    float s[4] = {0, 0, 0, 0};
+    for (int i = 0; i < 128; ++i) s[i % 4] += v[i] * v[i];
+    return (s[0] + s[1]) + (s[2] + s[3]);
+  };
+  const float total = std::sqrt(sumOfSquares(h));
   norm = total;
   if (total <= 0.5f) {
     norm = 0;
     return;
   }
   for (float& v : h) v = std::min(v / total, 0.2f);
-  sum = 0;
-  for (float v : h) sum += v * v;
-  const float length = std::sqrt(sum);
+  const float length = std::sqrt(sumOfSquares(h));
   for (int i = 0; i < 128; ++i) out[i] = static_cast<uint8_t>(static_cast<int>(h[i] / length * 255 + 0.5f));
 }
 
