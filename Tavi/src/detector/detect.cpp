@@ -1,4 +1,6 @@
 #include "detector/cascade_driver.h"
+#include "detector/pyramid_scan.h"
+#include "detector/window_grading.h"
 #include "tavilib.h"
 
 namespace tavilib {
@@ -7,7 +9,8 @@ Status detect(const Image& image, const Detector& detector, std::vector<Detectio
               const CascadeParameter& params) {
   // detect is const on the Detector, yet it runs (and so changes) its nets.
   auto* state = static_cast<DetectorState*>(const_cast<void*>(detector.getDetector()));
-  return runCascade(image, *state, detections, params, CascadeSteps());
+  static const CascadeSteps networkSteps{scanPyramid, gradeWindows, calibrateWindows};
+  return runCascade(image, *state, detections, params, networkSteps);
 }
 
 }  // namespace tavilib

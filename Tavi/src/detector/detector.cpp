@@ -1,15 +1,20 @@
 #include "detector/cascade_loader.h"
 #include "detector/detector_state.h"
+#include "nn/engine.h"
 #include "tavilib.h"
 
 namespace tavilib {
 
 namespace {
 
-// Stored before anything can fail, which is why is_loaded() holds after a
+// The old state goes first, also when the new load then fails. The new one is
+// stored before anything can fail, which is why is_loaded() holds after a
 // failed load.
 DetectorState* replaceState(DetectorState*& state) {
   delete state;
+  state = nullptr;
+  nn::Engine::set_mode(nn::Engine::CPU);
+  nn::Engine::set_phase(nn::Engine::TEST);
   state = new DetectorState();
   return state;
 }
