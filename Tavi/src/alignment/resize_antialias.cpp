@@ -18,13 +18,6 @@ float sinc(float x) {
   return std::sin(pix) / pix;
 }
 
-uint8_t toByte(float acc, float norm) {
-  const float v = acc * norm + 0.5f;
-  if (v < 0.5f) return 0;
-  if (v >= 255.0f) return 255;
-  return static_cast<uint8_t>(static_cast<int>(v));
-}
-
 // The taps of every destination index of one pass: index i reads source
 // positions first[i] .. first[i] + count[i] - 1 with weights
 // weights[i * stride ..], and its sum is multiplied by norm[i].
@@ -75,46 +68,62 @@ TapTable makeTaps(int srcLen, int dstLen) {
   return table;
 }
 
-// Along the rows: every destination column i blends source columns.
-void horizontalPass(const cv::Mat& src, cv::Mat& dst, const TapTable& taps, int channels) {
-  const int width = dst.cols;
-  std::vector<float> line(static_cast<size_t>(src.cols) * 3);
-  for (int y = 0; y < src.rows; ++y) {
-    const uint8_t* in = src.ptr<uint8_t>(y);
-    for (size_t k = 0; k < line.size(); ++k) line[k] = static_cast<float>(in[k]);
-    uint8_t* out = dst.ptr<uint8_t>(y);
-    for (int i = 0; i < width; ++i) {
-      const float* weights = &taps.weights[static_cast<size_t>(i) * taps.stride];
-      const float* base = &line[static_cast<size_t>(taps.first[i]) * 3];
-      const int count = taps.count[i];
-      for (int c = 0; c < channels; ++c) {
-        float sum = 0.0f;
-        for (int t = 0; t < count; ++t) sum += base[t * 3 + c] * weights[t];
-        out[i * 3 + c] = toByte(sum, taps.norm[i]);
-      }
-    }
-  }
-}
-
-// Along the columns: every destination row i blends source rows; each element
-// of the row keeps its own running sum, in tap order.
-void verticalPass(const cv::Mat& src, cv::Mat& dst, const TapTable& taps, int channels) {
-  const int width = src.cols;
-  std::vector<float> acc(static_cast<size_t>(width) * 3);
+// Every destination row i of dst blends source rows of src taps.first[i] ..;
+// each element of the row keeps its own running sum, in tap order, so the
+// loop over the row runs in vector lanes. dst has taps' length of rows and
+// src's row length.
+void verticalPass(const cv::Mat& src, cv::Mat& dst, const TapTable& taps) {
+  const size_t length = static_cast<size_t>(src.cols) * 3;
+  std::vector<float> acc(length);
   for (int i = 0; i < dst.rows; ++i) {
     const float* weights = &taps.weights[static_cast<size_t>(i) * taps.stride];
     std::fill(acc.begin(), acc.end(), 0.0f);
     for (int t = 0; t < taps.count[i]; ++t) {
       const uint8_t* in = src.ptr<uint8_t>(taps.first[i] + t);
       const float w = weights[t];
-      for (size_t k = 0; k < acc.size(); ++k) acc[k] += static_cast<float>(in[k]) * w;
+      for (size_t k = 0; k < length; ++k) acc[k] += static_cast<float>(in[k]) * w;
     }
     uint8_t* out = dst.ptr<uint8_t>(i);
     const float norm = taps.norm[i];
-    for (int x = 0; x < width; ++x) {
-      for (int c = 0; c < channels; ++c) out[x * 3 + c] = toByte(acc[x * 3 + c], norm);
+    for (size_t k = 0; k < length; ++k) {
+      // v below 0.5 gives 0, 255 and above give 255, the rest is truncated;
+      // written with a floor at 0 (truncation of [0, 0.5) is 0 too) to run in lanes.
+      const float v = acc[k] * norm + 0.5f;
+      out[k] = static_cast<uint8_t>(static_cast<int>(std::min(std::max(v, 0.0f), 255.0f)));
     }
   }
+}
+
+// Rows become columns: out(x, y) = in(y, x), three bytes a pixel.
+void transposePixels(const cv::Mat& in, cv::Mat& out) {
+  out.create(in.cols, in.rows, in.type());
+  constexpr int kBlock = 32;
+  for (int y0 = 0; y0 < in.rows; y0 += kBlock) {
+    for (int x0 = 0; x0 < in.cols; x0 += kBlock) {
+      const int y1 = std::min(in.rows, y0 + kBlock);
+      const int x1 = std::min(in.cols, x0 + kBlock);
+      for (int y = y0; y < y1; ++y) {
+        const uint8_t* from = in.ptr<uint8_t>(y);
+        for (int x = x0; x < x1; ++x) {
+          uint8_t* to = out.ptr<uint8_t>(x) + static_cast<size_t>(y) * 3;
+          to[0] = from[x * 3];
+          to[1] = from[x * 3 + 1];
+          to[2] = from[x * 3 + 2];
+        }
+      }
+    }
+  }
+}
+
+// Along the rows: every destination column i blends source columns. Done as
+// the column pass of the transposed image, which gives every sample the same
+// sum in the same order.
+void horizontalPass(const cv::Mat& src, cv::Mat& dst, const TapTable& taps) {
+  cv::Mat transposed;
+  transposePixels(src, transposed);
+  cv::Mat blended(dst.cols, dst.rows, src.type());
+  verticalPass(transposed, blended, taps);
+  transposePixels(blended, dst);
 }
 
 }  // namespace
@@ -150,11 +159,10 @@ cv::Mat resize_antialias_oracle(const cv::Mat& src, int width, int height) {
     return cv::Mat();
   }
   cv::Mat dst(height, width, src.type());
-  const int channels = src.channels();
   if (horizontal) {
-    horizontalPass(src, dst, makeTaps(columns, width), channels);
+    horizontalPass(src, dst, makeTaps(columns, width));
   } else {
-    verticalPass(src, dst, makeTaps(rows, height), channels);
+    verticalPass(src, dst, makeTaps(rows, height));
   }
   return dst;
 }

@@ -161,7 +161,9 @@ void accumulateRow(const SiftPyramid::SampleCell* line, const int64_t* dxs, cons
 
 #if defined(__x86_64__) || defined(__i386__)
 // The same with eight-lane registers, one per cell: half the operations.
-__attribute__((target("avx"))) void accumulateRowAvx(const SiftPyramid::SampleCell* line,
+// (AVX2 for the register broadcasts; no fused multiply-add, which would
+// change the roundings.)
+__attribute__((target("avx2"))) void accumulateRowAvx(const SiftPyramid::SampleCell* line,
                                                      const int64_t* dxs, const int* colBase,
                                                      const float* across, size_t columns, float uy,
                                                      float ty, float* top) {
@@ -192,12 +194,15 @@ __attribute__((target("avx"))) void accumulateRowAvx(const SiftPyramid::SampleCe
     const __m256 v = _mm256_add_ps(_mm256_load_ps(kUnit[cell.mainBin]),
                                    _mm256_mul_ps(_mm256_load_ps(kUnit[cell.secondBin]),
                                                  _mm256_set1_ps(cell.ratio)));
-    alignas(16) float w[4];
-    _mm_store_ps(w, corners);
-    tl = _mm256_add_ps(tl, _mm256_mul_ps(v, _mm256_broadcast_ss(w + 0)));
-    bl = _mm256_add_ps(bl, _mm256_mul_ps(v, _mm256_broadcast_ss(w + 1)));
-    tr = _mm256_add_ps(tr, _mm256_mul_ps(v, _mm256_broadcast_ss(w + 2)));
-    br = _mm256_add_ps(br, _mm256_mul_ps(v, _mm256_broadcast_ss(w + 3)));
+    const __m256 wide = _mm256_castps128_ps256(corners);
+    const __m256 w00 = _mm256_permutevar8x32_ps(wide, _mm256_set1_epi32(0));
+    const __m256 w10 = _mm256_permutevar8x32_ps(wide, _mm256_set1_epi32(1));
+    const __m256 w01 = _mm256_permutevar8x32_ps(wide, _mm256_set1_epi32(2));
+    const __m256 w11 = _mm256_permutevar8x32_ps(wide, _mm256_set1_epi32(3));
+    tl = _mm256_add_ps(tl, _mm256_mul_ps(v, w00));
+    bl = _mm256_add_ps(bl, _mm256_mul_ps(v, w10));
+    tr = _mm256_add_ps(tr, _mm256_mul_ps(v, w01));
+    br = _mm256_add_ps(br, _mm256_mul_ps(v, w11));
   }
   if (current >= 0) {
     _mm256_store_ps(top + current, tl);
@@ -207,7 +212,7 @@ __attribute__((target("avx"))) void accumulateRowAvx(const SiftPyramid::SampleCe
   }
 }
 
-const bool kHasAvx = __builtin_cpu_supports("avx");
+const bool kHasAvx = __builtin_cpu_supports("avx2");
 #endif
 
 }  // namespace

@@ -41,9 +41,13 @@ void ReferenceDescriptor(const SiftPyramid& pyramid, float x, float y, float lev
   const int s = static_cast<int>(static_cast<double>(level) + 0.5);
   const float ox = static_cast<float>(xi) - x;
   const float oy = static_cast<float>(yi) - y;
+  // k^s by repeated squaring.
   float power = 1.0f;
-  for (int i = 0; i < s; ++i) power *= pyramid.sigmaRatio();  // exact for s <= 2
-  if (s == 3) power = pyramid.sigmaRatio() * (pyramid.sigmaRatio() * pyramid.sigmaRatio());
+  float base = pyramid.sigmaRatio();
+  for (int e = s; e > 0; e >>= 1) {
+    if (e & 1) power *= base;
+    base *= base;
+  }
   const float binW = power * 0.8f * 4.0f;
   const int R = static_cast<int>(static_cast<double>(binW) * std::sqrt(2.0) * 4.0 * 0.5 + 0.5);
   const int width = static_cast<int>(pyramid.width());
@@ -392,6 +396,67 @@ TEST(SiftPyramidTest, HalfCoordinatesRoundTowardZeroAfterAddingAHalf) {
     pyramid.computeDescriptor(x, 20.0f, 1.0f, actualNorm, actual);
     EXPECT_EQ(actualNorm, expectedNorm) << x;
     EXPECT_EQ(std::memcmp(actual, expected, 128), 0) << x;
+  }
+}
+
+
+TEST(SiftPyramidTest, BuildingFewerLevelsGivesTheSameLowerLevels) {
+  const std::vector<uint8_t> pixels = BlobPixels(45, 38);
+  SiftPyramid all(45, 38, 3);
+  all.buildBase(45, 38, pixels.data());
+  all.buildLevels();
+  SiftPyramid some(45, 38, 3);
+  some.buildBase(45, 38, pixels.data());
+  some.buildLevels(2);
+  for (size_t i = 0; i <= 2; ++i) {
+    EXPECT_EQ(std::memcmp(all.level(i).pixels, some.level(i).pixels, 45 * 38 * sizeof(float)), 0) << i;
+  }
+  uint8_t a[128] = {};
+  uint8_t b[128] = {};
+  float na = 0;
+  float nb = 0;
+  all.computeDescriptor(20.3f, 17.8f, 2.0f, na, a);
+  some.computeDescriptor(20.3f, 17.8f, 2.0f, nb, b);
+  EXPECT_EQ(na, nb);
+  EXPECT_EQ(std::memcmp(a, b, 128), 0);
+}
+
+// Images with exact zeros and exact diagonals in their differences: steps,
+// a checkerboard and flat areas, so that every branch of the orientation
+// (dx = 0, dy = 0, |r| = 1, the wrap at two pi) is met.
+TEST(SiftPyramidTest, DescriptorsOfStructuredImagesMatchThePlainTranscription) {
+  const int width = 64;
+  const int height = 48;
+  std::vector<std::vector<uint8_t>> images;
+  std::vector<uint8_t> steps(width * height);
+  std::vector<uint8_t> checker(width * height);
+  std::vector<uint8_t> diagonal(width * height);
+  for (int y = 0; y < height; ++y) {
+    for (int x = 0; x < width; ++x) {
+      steps[y * width + x] = static_cast<uint8_t>(x < 20 ? 10 : x < 40 ? 200 : (y < 24 ? 90 : 30));
+      checker[y * width + x] = static_cast<uint8_t>(((x / 6) + (y / 6)) % 2 ? 250 : 5);
+      diagonal[y * width + x] = static_cast<uint8_t>(x + y < 50 ? 0 : x - y > 10 ? 255 : 128);
+    }
+  }
+  images = {steps, checker, diagonal};
+  for (const std::vector<uint8_t>& pixels : images) {
+    SiftPyramid pyramid(width, height, 3);
+    pyramid.buildBase(width, height, pixels.data());
+    pyramid.buildLevels();
+    for (int level = 0; level <= 5; ++level) {
+      for (float y = 2.0f; y < height; y += 5.5f) {
+        for (float x = 1.0f; x < width; x += 4.75f) {
+          uint8_t expected[128] = {};
+          uint8_t actual[128] = {};
+          float expectedNorm = -1;
+          float actualNorm = -2;
+          ReferenceDescriptor(pyramid, x, y, static_cast<float>(level), expectedNorm, expected);
+          pyramid.computeDescriptor(x, y, static_cast<float>(level), actualNorm, actual);
+          ASSERT_EQ(actualNorm, expectedNorm) << x << "," << y << " level " << level;
+          ASSERT_EQ(std::memcmp(actual, expected, 128), 0) << x << "," << y << " level " << level;
+        }
+      }
+    }
   }
 }
 
