@@ -1,0 +1,47 @@
+#include "detector/cascade_files.h"
+
+#include <gtest/gtest.h>
+
+#include <string>
+
+#include "temp_dir.h"
+
+namespace tavilib {
+namespace {
+
+TEST(CascadeFilesTest, ListLinesNeedTheirNewline) {
+  TempDir dir;
+  const std::vector<CascadeListEntry> entries = readCascadeList(
+      dir.write("list", "# stages\nx16 0.4 trailing words\n#x32 0.8\n\nx64 0.98\nlast 0.5"));
+  ASSERT_EQ(entries.size(), 3u) << "the unterminated last line is dropped";
+  EXPECT_EQ(entries[0].folder, "x16");
+  EXPECT_EQ(entries[0].threshold, 0.4f);
+  EXPECT_EQ(entries[1].folder, "") << "an empty line is a stage, not a comment";
+  EXPECT_EQ(entries[2].folder, "x64");
+  EXPECT_EQ(entries[2].threshold, 0.98f);
+  EXPECT_TRUE(readCascadeList(dir.path() + "/missing").empty());
+}
+
+TEST(CascadeFilesTest, MeanFilesNeedWhiteSpaceAfterTheLastNumber) {
+  TempDir dir;
+  EXPECT_EQ(readMeanFile(dir.write("a", "1.5 2\n3\t4 \n")), (std::vector<float>{1.5f, 2, 3, 4}));
+  EXPECT_EQ(readMeanFile(dir.write("b", "1.5 2 3")), (std::vector<float>{1.5f, 2}));
+  EXPECT_EQ(readMeanFile(dir.write("c", "1 2 x 3\n")), (std::vector<float>{1, 2}));
+  EXPECT_TRUE(readMeanFile(dir.path() + "/missing").empty());
+}
+
+TEST(CascadeFilesTest, OffsetsAreReadUntilTheFirstBadTriple) {
+  TempDir dir;
+  const std::vector<OffsetScale> table =
+      readOffsetsScales(dir.write("offsets", "0 0 1\n-4 4 0.9166666666666666\n5 5 1.0833"));
+  ASSERT_EQ(table.size(), 3u) << "a last number at the end of the file counts";
+  EXPECT_EQ(table[1].offsetX, -4);
+  EXPECT_EQ(table[1].offsetY, 4);
+  EXPECT_EQ(table[1].scale, 0.9166666666666666f);
+  EXPECT_EQ(table[2].scale, 1.0833f);
+  EXPECT_EQ(readOffsetsScales(dir.write("bad", "1 1 1\n2 x 1\n3 3 1\n")).size(), 1u);
+  EXPECT_TRUE(readOffsetsScales(dir.path() + "/missing").empty());
+}
+
+}  // namespace
+}  // namespace tavilib
