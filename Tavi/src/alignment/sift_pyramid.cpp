@@ -160,6 +160,11 @@ void accumulateRow(const SiftPyramid::SampleCell* line, const int64_t* dxs, cons
 }
 
 #if defined(__x86_64__) || defined(__i386__)
+const bool kWideRowsAvailable = [] {
+  __builtin_cpu_init();  // this runs among the static constructors
+  return __builtin_cpu_supports("avx2") != 0;
+}();
+
 // The same with eight-lane registers, one per cell: half the operations.
 // (AVX2 for the register broadcasts; no fused multiply-add, which would
 // change the roundings.)
@@ -212,10 +217,23 @@ __attribute__((target("avx2"))) void accumulateRowAvx(const SiftPyramid::SampleC
   }
 }
 
-const bool kHasAvx = __builtin_cpu_supports("avx2");
 #endif
 
+// Whether accumulateRowAvx may run: the processor has it and no test has
+// switched it off.
+bool wideRows = kWideRowsAvailable;
+
 }  // namespace
+
+bool SiftPyramid::setWideHistogramRows(bool enabled) {
+#if defined(__x86_64__) || defined(__i386__)
+  wideRows = enabled && kWideRowsAvailable;
+  return wideRows;
+#else
+  (void)enabled;
+  return false;
+#endif
+}
 
 void FloatImage::resize(uint64_t newWidth, uint64_t newHeight) {
   const uint64_t count = newWidth * newHeight;
@@ -570,7 +588,7 @@ void SiftPyramid::computeDescriptor(float x, float y, float level, float& norm, 
     float* top = padded + (static_cast<int>(row0) + 3) * kPaddedSide * 8;
     const SampleCell* line = cells.data() + (yi + dy) * w + xi;
 #if defined(__x86_64__) || defined(__i386__)
-    if (kHasAvx) {
+    if (wideRows) {
       accumulateRowAvx(line, dxs.data(), colBase.data(), across.data(), columns, uy, ty, top);
       continue;
     }

@@ -98,6 +98,11 @@ class SiftPyramid {
   // Whether ensureGradient has filled a level.
   bool hasGradient(size_t level) const { return !gradients_[level].empty(); }
 
+  // Chooses the eight-lane (AVX2) histogram loop where the processor has it,
+  // or the four-lane one; both give the same bytes. Returns whether the wide
+  // loop is on. For tests: process-wide and not thread-safe.
+  static bool setWideHistogramRows(bool enabled);
+
   static constexpr float kBaseSigmaIn = 0.5f;
   static constexpr float kBaseSigma = 0.8f;
   static constexpr float kBinSigmas = 4.0f;

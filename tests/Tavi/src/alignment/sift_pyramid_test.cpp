@@ -460,5 +460,37 @@ TEST(SiftPyramidTest, DescriptorsOfStructuredImagesMatchThePlainTranscription) {
   }
 }
 
+TEST(SiftPyramidTest, FourAndEightLaneHistogramLoopsGiveTheSameBytes) {
+  const int width = 97;
+  const int height = 83;
+  const std::vector<uint8_t> pixels = RandomPixels(width * height, 21);
+  SiftPyramid pyramid(width, height, 3);
+  pyramid.buildBase(width, height, pixels.data());
+  pyramid.buildLevels();
+  std::mt19937 generator(22);
+  std::uniform_real_distribution<float> coordinate(-5.0f, 100.0f);
+  for (int i = 0; i < 200; ++i) {
+    const float x = coordinate(generator);
+    const float y = coordinate(generator);
+    const float level = static_cast<float>(i % 4);
+    uint8_t expected[128] = {};
+    uint8_t narrow[128] = {};
+    uint8_t wide[128] = {};
+    float expectedNorm = 0;
+    float narrowNorm = 0;
+    float wideNorm = 0;
+    ReferenceDescriptor(pyramid, x, y, level, expectedNorm, expected);
+    SiftPyramid::setWideHistogramRows(false);
+    pyramid.computeDescriptor(x, y, level, narrowNorm, narrow);
+    SiftPyramid::setWideHistogramRows(true);
+    pyramid.computeDescriptor(x, y, level, wideNorm, wide);
+    ASSERT_EQ(narrowNorm, expectedNorm);
+    ASSERT_EQ(wideNorm, expectedNorm);
+    ASSERT_EQ(std::memcmp(narrow, expected, 128), 0) << x << "," << y;
+    ASSERT_EQ(std::memcmp(wide, expected, 128), 0) << x << "," << y;
+  }
+  SiftPyramid::setWideHistogramRows(true);
+}
+
 }  // namespace
 }  // namespace SDMCore
