@@ -20,6 +20,8 @@
 #include <string>
 #include <vector>
 
+#include <unistd.h>
+
 #include <opencv2/core.hpp>
 #include <opencv2/imgproc.hpp>
 
@@ -73,7 +75,9 @@ struct Fixture {
       model.stageBiases.push_back(bias);
     }
     model.stageMatrices.push_back(mp::matrix(1, 1));
-    folder = (std::filesystem::temp_directory_path() / "tavi-alignment-benchmark").string();
+    folder = (std::filesystem::temp_directory_path() /
+              ("tavi-alignment-benchmark-" + std::to_string(::getpid())))
+                 .string();
     std::filesystem::create_directories(folder);
     {
       std::ofstream out(folder + "/model.sdm", std::ios::binary);
