@@ -4,7 +4,9 @@
 
 #include <algorithm>
 #include <cmath>
+#include <cstddef>
 #include <cstdint>
+#include <cstring>
 #include <vector>
 
 #include <opencv2/core.hpp>
@@ -237,6 +239,38 @@ TEST(FitFaceTest, UsesTheProcessWideModel) {
   const std::vector<float> global = fitFace(unit);
   sdmModel = saved;
   EXPECT_EQ(global, fitFace(model, copy));
+}
+
+#if defined(__GNUC__) && defined(__x86_64__)
+TEST(GeneralUnitTest, VirtualOperationsStandInTheirSlotOrder) {
+  // Itanium ABI: 1 + the byte offset of the slot.
+  auto slot = [](auto f) {
+    ptrdiff_t raw;
+    std::memcpy(&raw, &f, sizeof raw);
+    return (raw - 1) / static_cast<ptrdiff_t>(sizeof(void*));
+  };
+  EXPECT_EQ(slot(&GeneralUnit::normalize), 0);
+  EXPECT_EQ(slot(&GeneralUnit::normalizeImage), 1);
+  EXPECT_EQ(slot(&GeneralUnit::scaleFaceRect), 2);
+  EXPECT_EQ(slot(&GeneralUnit::restoreShapes), 3);
+}
+#endif
+
+TEST(GeneralUnitTest, NormalizeScalesImageShapesAndBox) {
+  GeneralUnit unit;
+  unit.image = cv::Mat(100, 80, CV_8UC1, cv::Scalar(7));
+  unit.faceRect = cv::Rect(10, 21, 40, 30);
+  unit.referenceShape = {4.0f, 8.0f};
+  unit.resultShape = {2.0f, 6.0f};
+  unit.normalize(60);
+  EXPECT_EQ(unit.scale, 1.5f);
+  EXPECT_EQ(unit.image.size(), cv::Size(120, 150));
+  EXPECT_EQ(unit.faceRect, cv::Rect(15, 31, 60, 45));
+  EXPECT_EQ(unit.referenceShape, (std::vector<float>{6.0f, 12.0f}));
+  EXPECT_EQ(unit.resultShape, (std::vector<float>{3.0f, 9.0f}));
+  unit.restoreShapes();
+  EXPECT_EQ(unit.resultShape, (std::vector<float>{2.0f, 6.0f}));
+  EXPECT_EQ(unit.referenceShape, (std::vector<float>{4.0f, 8.0f}));
 }
 
 }  // namespace
