@@ -139,9 +139,9 @@ TAVI_EXPORT Status loadDetector(Detector& detector, const DetectorParams& params
 TAVI_EXPORT void unloadDetector(Detector& detector);
 
 // Finds faces and appends them to detections, best score first; what the
-// vector held before stays in front.
-// REQUIRES: detector has been loaded (is_loaded() is true); after a failed load
-//   this returns STATUS_DETECTOR_NOT_READY and leaves detections as they were.
+// vector held before stays in front. A detector that is not loaded, or whose
+// last load failed, gives STATUS_DETECTOR_NOT_READY and leaves detections as
+// they were.
 // REQUIRES: params make the base image fit the first network's declared input
 //   (roughly windowSize / minFaceRatio at most 384 for the built-in cascade).
 // REQUIRES: no other thread uses the same Detector during the call.

@@ -38,16 +38,16 @@ TEST(DetectorTest, FailedLoadLeavesAStateThatRefusesToDetect) {
   unloadDetector(detector);
   EXPECT_FALSE(detector.is_loaded());
 
-  const DetectorParams nowhere;
-  EXPECT_EQ(loadDetector(detector, nowhere), STATUS_MODEL_LOAD_FAILED);
-  EXPECT_TRUE(detector.is_loaded());
-  const void* firstState = detector.getDetector();
-  EXPECT_NE(firstState, nullptr);
-
   std::vector<unsigned char> pixels(30 * 20 * 3, 128);
   const Image image{30, 20, 0, pixels.data()};
   const CascadeParameter params{1.0f, 320, 0.1f, 3, 1.5f, 12};
   std::vector<Detection> detections(3);
+  EXPECT_EQ(detect(image, detector, detections, params), STATUS_DETECTOR_NOT_READY);
+
+  const DetectorParams nowhere;
+  EXPECT_EQ(loadDetector(detector, nowhere), STATUS_MODEL_LOAD_FAILED);
+  EXPECT_TRUE(detector.is_loaded());
+  EXPECT_NE(detector.getDetector(), nullptr);
   EXPECT_EQ(detect(image, detector, detections, params), STATUS_DETECTOR_NOT_READY);
   EXPECT_EQ(detections.size(), 3u);
 
