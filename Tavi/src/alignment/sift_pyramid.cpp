@@ -563,22 +563,30 @@ void SiftPyramid::computeDescriptor(float x, float y, float level, float& norm, 
   std::vector<int64_t>& dxs = scratchDx_;
   std::vector<int>& colBase = scratchColumn_;
   std::vector<float>& across = scratchAcross_;  // 1 - tx, 1 - tx, tx, tx
-  dxs.clear();
-  colBase.clear();
-  across.clear();
+  const size_t span = static_cast<size_t>(std::max<int64_t>(0, dxHi - dxLo + 1));
+  if (dxs.size() < span) {
+    dxs.resize(span);
+    colBase.resize(span);
+    across.resize(4 * span);
+  }
+  size_t columns = 0;
   for (int64_t dx = dxLo; dx <= dxHi; ++dx) {
     const float fx = (static_cast<float>(dx) + ox) / binW - 0.5f;
     const float col0 = std::floor(fx);
     if (col0 < -3.0f || col0 > 1.0f) continue;
     const float tx = fx - col0;
-    dxs.push_back(dx);
-    colBase.push_back((static_cast<int>(col0) + 3) * 8);
-    across.insert(across.end(), {1.0f - tx, 1.0f - tx, tx, tx});
+    dxs[columns] = dx;
+    colBase[columns] = (static_cast<int>(col0) + 3) * 8;
+    float* a = &across[4 * columns];
+    a[0] = 1.0f - tx;
+    a[1] = 1.0f - tx;
+    a[2] = tx;
+    a[3] = tx;
+    ++columns;
   }
 
   alignas(32) float padded[kPaddedBins] = {};
   const std::vector<SampleCell>& cells = gradients_[s];
-  const size_t columns = dxs.size();
   for (int64_t dy = dyLo; dy <= dyHi; ++dy) {
     const float fy = (static_cast<float>(dy) + oy) / binW - 0.5f;
     const float row0 = std::floor(fy);
