@@ -8,6 +8,7 @@
 #include <string>
 #include <vector>
 
+#include "blob_proto_maker.h"
 #include "nn/net.h"
 #include "nn/proto/nn.pb.h"
 #include "temp_dir.h"
@@ -16,18 +17,7 @@
 namespace tavilib {
 namespace testing_cascade {
 
-inline nn::BlobProto MakeBlob(int num, int channels, int height, int width,
-                              const std::vector<float>& data) {
-  nn::BlobProto blob;
-  blob.set_num(num);
-  blob.set_channels(channels);
-  blob.set_height(height);
-  blob.set_width(width);
-  for (float v : data) {
-    blob.add_data(v);
-  }
-  return blob;
-}
+using nn::MakeBlob;
 
 // A scan net over a declared input of size x size: one 12 x 12 convolution of
 // stride 6 into two classes, then the softmax. The face logit is

@@ -8,6 +8,7 @@
 #include <vector>
 
 #include "nn/engine.h"
+#include "blob_proto_maker.h"
 #include "gradient_checker.h"
 #include "temp_dir.h"
 
@@ -18,18 +19,6 @@ NetParameter Parse(const std::string& text) {
   NetParameter param;
   EXPECT_TRUE(google::protobuf::TextFormat::ParseFromString(text, &param)) << text;
   return param;
-}
-
-BlobProto MakeBlob(int num, int channels, int height, int width, const std::vector<float>& data) {
-  BlobProto blob;
-  blob.set_num(num);
-  blob.set_channels(channels);
-  blob.set_height(height);
-  blob.set_width(width);
-  for (float v : data) {
-    blob.add_data(v);
-  }
-  return blob;
 }
 
 // One input 1x1x4x4 and one convolution of two 3x3 outputs: all-ones weights
