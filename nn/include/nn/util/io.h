@@ -7,6 +7,10 @@
 
 #include "nn/proto/nn.pb.h"
 
+namespace cv {
+class Mat;
+}  // namespace cv
+
 namespace nn {
 
 using google::protobuf::Message;
@@ -26,6 +30,9 @@ inline bool ReadProtoFromTextFile(const std::string& filename, Message* proto) {
 // Parses a text-format message held in memory.
 bool ReadProtoFromTextFile1(const std::string& text, Message* proto);
 bool ReadProtoFromBinaryFile(const char* filename, Message* proto);
+// The same for files the caller can't go on without: one that doesn't parse
+// ends the process.
+void ReadProtoFromBinaryFileOrDie(const char* filename, Message* proto);
 
 // Each writer replaces the file with the message, in the text or the binary
 // format, and returns whether all of it was written.
@@ -38,6 +45,14 @@ void ReadNetParamsFromTextFile(const std::string& param_file, NetParameter* para
 // Here param_file holds the description text itself.
 void ReadNetParamsFromText(const std::string& param_file, NetParameter* param);
 void ReadNetParamsFromBinaryFile(const std::string& param_file, NetParameter* param);
+
+// Fills datum with a 3-channel 8-bit image, resized first (bilinear) when
+// both sizes are above 0, with new_height as the width and new_width as the
+// height: callers pass them in this order. The planes go last channel first,
+// so blue-green-red pixels give a red-green-blue record. The label is 0.
+// Returns true.
+// REQUIRES: image is empty or of type CV_8UC3 (checked).
+bool ReadImageToDatum(const cv::Mat& image, int new_height, int new_width, Datum* datum);
 
 }  // namespace nn
 

@@ -6,6 +6,8 @@
 #include <google/protobuf/io/zero_copy_stream_impl.h>
 #include <google/protobuf/io/zero_copy_stream_impl_lite.h>
 #include <google/protobuf/text_format.h>
+#include <opencv2/core.hpp>
+#include <opencv2/imgproc.hpp>
 #include <sys/stat.h>
 #include <unistd.h>
 
@@ -71,6 +73,10 @@ bool ReadProtoFromBinaryFile(const char* filename, Message* proto) {
   return success;
 }
 
+void ReadProtoFromBinaryFileOrDie(const char* filename, Message* proto) {
+  CHECK(ReadProtoFromBinaryFile(filename, proto));
+}
+
 bool WriteProtoToTextFile(const Message& proto, const std::string& filename) {
   std::ofstream file(filename, std::ios::binary | std::ios::trunc);
   bool printed = false;
@@ -88,6 +94,33 @@ bool WriteProtoToBinaryFile(const Message& proto, const std::string& filename) {
   const bool serialized = proto.SerializeToOstream(&file);
   file.close();
   return serialized && !file.fail();
+}
+
+bool ReadImageToDatum(const cv::Mat& image, int new_height, int new_width, Datum* datum) {
+  // Three bytes a pixel are read whatever the image holds: refuse the rest.
+  CHECK(image.empty() || image.type() == CV_8UC3)
+      << "ReadImageToDatum takes 8-bit images of three channels, not of type " << image.type();
+  cv::Mat resized = image;
+  if (new_height > 0 && new_width > 0) {
+    // The swap of width and height is how the data layers have always sized.
+    cv::resize(image, resized, cv::Size(new_height, new_width), 0, 0, cv::INTER_LINEAR);
+  }
+  datum->set_channels(3);
+  datum->set_height(resized.rows);
+  datum->set_width(resized.cols);
+  datum->set_label(0);
+  datum->clear_data();
+  std::string* buffer = datum->mutable_data();
+  buffer->reserve(static_cast<size_t>(3) * resized.rows * resized.cols);
+  for (int c = 2; c >= 0; --c) {
+    for (int h = 0; h < resized.rows; ++h) {
+      const cv::Vec3b* row = resized.ptr<cv::Vec3b>(h);
+      for (int w = 0; w < resized.cols; ++w) {
+        buffer->push_back(static_cast<char>(row[w][c]));
+      }
+    }
+  }
+  return true;
 }
 
 namespace {
