@@ -5,6 +5,7 @@
 #include <cstdlib>
 #include <set>
 
+#include "nn/data_layers.h"
 #include "nn/util/insert_splits.h"
 #include "nn/util/io.h"
 #include "nn/util/math_functions.h"
@@ -75,6 +76,10 @@ void Net<Dtype>::Init(const NetParameter& in_param) {
     layers_.push_back(boost::shared_ptr<Layer<Dtype>>(GetLayer<Dtype>(layer_param)));
     CHECK(layers_.back()) << "Layer " << layer_param.name()
                           << " has a type this engine does not implement.";
+    if (useActiveImages_ && layer_param.type() == LayerParameter::IMAGE_DATA) {
+      static_cast<ImageDataLayer<Dtype>*>(layers_.back().get())
+          ->set_active_images(activeImagePtrs_);
+    }
     layer_names_.push_back(layer_param.name());
     bool need_backward = param.force_backward();
 
