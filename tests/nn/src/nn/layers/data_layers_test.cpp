@@ -13,6 +13,7 @@
 #include <tuple>
 #include <vector>
 
+#include "blob_proto_maker.h"
 #include "nn/engine.h"
 #include "nn/net.h"
 #include "nn/util/io.h"
@@ -138,15 +139,7 @@ TEST(DataLayerTest, BatchesRunOnAcrossTheEndOfTheDatabase) {
   const std::string source =
       WriteDatabase(dir, {ByteDatum(2, 1, 2, 10, 0), ByteDatum(2, 1, 2, 20, 1),
                           ByteDatum(2, 1, 2, 30, 2)});
-  BlobProto mean;
-  mean.set_num(1);
-  mean.set_channels(2);
-  mean.set_height(1);
-  mean.set_width(2);
-  for (float v : {1.0f, 2.0f, 3.0f, 4.0f}) {
-    mean.add_data(v);
-  }
-  ASSERT_TRUE(WriteProtoToBinaryFile(mean, dir.path() + "/mean"));
+  ASSERT_TRUE(WriteProtoToBinaryFile(MakeBlob(1, 2, 1, 2, {1, 2, 3, 4}), dir.path() + "/mean"));
   LayerParameter param = DataParam(source, 2);
   param.mutable_data_param()->set_mean_file(dir.path() + "/mean");
   param.mutable_data_param()->set_scale(0.5f);
@@ -354,12 +347,7 @@ TEST(DataLayerDeathTest, SetUpAndWorkerRefuseBadSettings) {
     EXPECT_DEATH(run(param, {}, two), "Check failed: prefetch_rng_ ");
   }
 
-  BlobProto mean;
-  mean.set_num(1);
-  mean.set_channels(2);
-  mean.set_height(2);
-  mean.set_width(3);
-  ASSERT_TRUE(WriteProtoToBinaryFile(mean, dir.path() + "/mean"));
+  ASSERT_TRUE(WriteProtoToBinaryFile(MakeBlob(1, 2, 2, 3, {}), dir.path() + "/mean"));
   param = plain;
   param.mutable_data_param()->set_mean_file(dir.path() + "/mean");
   EXPECT_DEATH(run(param, {}, two),

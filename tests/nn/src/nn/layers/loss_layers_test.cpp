@@ -12,6 +12,7 @@
 #include <string>
 #include <vector>
 
+#include "blob_proto_maker.h"
 #include "gradient_checker.h"
 #include "nn/net.h"
 #include "nn/util/io.h"
@@ -58,16 +59,8 @@ void CheckLossGradient(Layer<float>* layer, Blob<float>* p, Blob<float>* t, floa
 }
 
 std::string WriteMatrix(const TempDir& dir, int size, const std::vector<float>& values) {
-  BlobProto matrix;
-  matrix.set_num(1);
-  matrix.set_channels(1);
-  matrix.set_height(size);
-  matrix.set_width(size);
-  for (float v : values) {
-    matrix.add_data(v);
-  }
   const std::string path = dir.path() + "/infogain";
-  EXPECT_TRUE(WriteProtoToBinaryFile(matrix, path));
+  EXPECT_TRUE(WriteProtoToBinaryFile(MakeBlob(1, 1, size, size, values), path));
   return path;
 }
 
