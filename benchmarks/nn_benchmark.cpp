@@ -96,12 +96,12 @@ void RegisterBenchmarks() {
       ->Args({70, 53})
       ->Unit(benchmark::kMicrosecond);
 
-  for (const CascadeNet& spec : kNets) {
-    auto net = std::make_shared<Net<float>>(spec.text, NetDescription::kText);
+  for (const CascadeNet& cascade : kNets) {
+    auto net = std::make_shared<Net<float>>(cascade.text, NetDescription::kText);
     FillInput(*net);
     net->Forward();
     for (size_t i = 0; i < net->layers().size(); ++i) {
-      const std::string name = std::string(spec.label) + "/" + net->layer_names()[i];
+      const std::string name = std::string(cascade.label) + "/" + net->layer_names()[i];
       benchmark::RegisterBenchmark(("Layer/" + name).c_str(), BM_Layer, net, i)
           ->Unit(benchmark::kMicrosecond);
       if (net->layers()[i]->layer_param().type() != nn::LayerParameter::CONVOLUTION) {
