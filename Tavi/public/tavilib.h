@@ -33,9 +33,9 @@ namespace tavilib {
 enum Status : int32_t {
   STATUS_OK = 0,
   // No cascade stage was loaded, the calibration net is missing, or the
-  // alignment model file was refused.
+  // alignment model file was refused (also from an alignment without a model).
   STATUS_MODEL_LOAD_FAILED = -3,
-  // The Detector holds a state whose load did not complete.
+  // The Detector holds no state, or one whose load did not complete.
   STATUS_DETECTOR_NOT_READY = -6,
 };
 
@@ -156,9 +156,9 @@ TAVI_EXPORT Status loadSDMModel(const std::string& folder, const std::string& fi
 // REQUIRES: no alignment runs during the call.
 TAVI_EXPORT Status unloadSDMModel();
 // Replaces the contents of points by 68 landmarks as 136 floats, interleaved
-// x and y, in pixels of image.
-// REQUIRES: a model was loaded with STATUS_OK; image rows are tightly packed
-//   (stride is ignored).
+// x and y, in pixels of image. Without a loaded 68-point model (none loaded,
+// or the last load failed) gives STATUS_MODEL_LOAD_FAILED and no points.
+// REQUIRES: image rows are tightly packed (stride is ignored).
 TAVI_EXPORT Status align68Points(const Image& image, const Rectangle<float>& rect,
                                  std::vector<float>& points);
 // Replaces the contents of points by five landmarks as 10 floats: the centres

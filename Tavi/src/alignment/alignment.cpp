@@ -44,6 +44,13 @@ Status unloadSDMModel() {
 }
 
 Status align68Points(const Image& image, const Rectangle<float>& rect, std::vector<float>& points) {
+  // Without a model of 68 points (none loaded, or the last load failed) there
+  // is nothing to regress with.
+  if (SDMCore::sdmModel == nullptr ||
+      SDMCore::sdmModel->meanShape.size() != 2 * static_cast<size_t>(kLandmarkCount)) {
+    points.clear();
+    return STATUS_MODEL_LOAD_FAILED;
+  }
   // Rows are taken as tightly packed; stride is not read.
   cv::Mat work(image.height, image.width, CV_8UC3, image.data,
                static_cast<size_t>(image.width) * 3);
@@ -138,7 +145,11 @@ Status align68Points(const Image& image, const Rectangle<float>& rect, std::vect
 
 Status align5Points(const Image& image, const Rectangle<float>& rect, std::vector<float>& points) {
   std::vector<float> all;
-  align68Points(image, rect, all);
+  const Status status = align68Points(image, rect, all);
+  if (status != STATUS_OK) {
+    points.clear();
+    return status;
+  }
   float five[10];
   for (size_t g = 0; g < fivePointGroups.size(); ++g) {
     const std::vector<int>& group = fivePointGroups[g];

@@ -105,8 +105,20 @@ TEST_F(AlignmentTest, FortyByteModelLoads) {
 
 TEST_F(AlignmentTest, MissingFileIsRefused) {
   EXPECT_EQ(loadSDMModel(dir_.path(), "nothing.sdm"), STATUS_MODEL_LOAD_FAILED);
+  // Alignment on the blank record a failed load leaves, or on none at all,
+  // gives no points rather than reading past an empty shape.
+  std::vector<uint8_t> pixels = Texture(120, 100);
+  const Image image{120, 100, 0, pixels.data()};
+  std::vector<float> points(3, 1.0f);
+  EXPECT_EQ(align68Points(image, Rectangle<float>{20, 20, 80, 80}, points),
+            STATUS_MODEL_LOAD_FAILED);
+  EXPECT_TRUE(points.empty());
   EXPECT_EQ(unloadSDMModel(), STATUS_OK);
   EXPECT_EQ(unloadSDMModel(), STATUS_OK);
+  points.assign(3, 1.0f);
+  EXPECT_EQ(align5Points(image, Rectangle<float>{20, 20, 80, 80}, points),
+            STATUS_MODEL_LOAD_FAILED);
+  EXPECT_TRUE(points.empty());
 }
 
 TEST_F(AlignmentTest, SixtyEightPointsInImagePixels) {
