@@ -21,124 +21,88 @@ using testing::HasSubstr;
 const char kTextTool[] = UPGRADE_NET_PROTO_TEXT;
 const char kBinaryTool[] = UPGRADE_NET_PROTO_BINARY;
 
-struct ToolRun {
-  int exit_status;  // -1 if the tool did not exit normally
-  std::string errors;
-};
-
 std::string ReadFile(const std::string& path) {
-  std::ifstream file(path, std::ios::binary);
   std::ostringstream contents;
-  contents << file.rdbuf();
+  contents << std::ifstream(path, std::ios::binary).rdbuf();
   return contents.str();
 }
 
-ToolRun RunTool(const std::string& tool, const std::vector<std::string>& args, const TempDir& dir) {
+// The tool's exit status (-1 if it did not exit normally); its stderr goes to
+// *errors.
+int RunTool(const std::string& tool, const std::vector<std::string>& args, const TempDir& dir,
+            std::string* errors) {
   std::string command = tool;
   for (const std::string& arg : args) {
     command += " '" + arg + "'";
   }
-  const std::string errors = dir.path() + "/tool-stderr";
-  command += " >/dev/null 2>'" + errors + "'";
-  const int status = std::system(command.c_str());
-  return {WIFEXITED(status) ? WEXITSTATUS(status) : -1, ReadFile(errors)};
+  const int status = std::system((command + " >/dev/null 2>'" + dir.path() + "/stderr'").c_str());
+  *errors = ReadFile(dir.path() + "/stderr");
+  return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
 }
 
-nn::NetParameter ParseText(const std::string& text) {
+nn::NetParameter Parse(const std::string& text) {
   nn::NetParameter param;
   EXPECT_TRUE(google::protobuf::TextFormat::ParseFromString(text, &param)) << text;
   return param;
 }
 
-const char kV0Net[] = R"(
-name: "old"
-input: "data"
-input_dim: 1 input_dim: 1 input_dim: 8 input_dim: 8
-layers { layer { name: "pad" type: "padding" pad: 1 } bottom: "data" top: "padded" }
-layers {
-  layer {
-    name: "conv" type: "conv" num_output: 1 kernelsize: 1 meanfile: "stray"
-    blobs { num: 1 channels: 1 height: 1 width: 1 data: 0.1 }
-  }
-  bottom: "padded" top: "conv"
-}
-)";
-
-const char kCurrentNet[] = R"(
-name: "old"
-input: "data"
-input_dim: 1 input_dim: 1 input_dim: 8 input_dim: 8
-layers {
-  name: "conv" type: CONVOLUTION bottom: "data" top: "conv"
-  blobs { num: 1 channels: 1 height: 1 width: 1 data: 0.1 }
-  convolution_param { num_output: 1 pad: 1 kernel_size: 1 }
-}
-)";
+const char kCurrentNet[] = R"(name: "old" input: "data" layers {
+  name: "conv" type: CONVOLUTION bottom: "data" top: "conv" convolution_param { pad: 1 } })";
 
 TEST(UpgradeNetProtoTest, ToolsUpgradeOldFilesAndKeepCurrentOnes) {
-  struct Form {
-    const char* tool;
-    std::string old_file;
-    bool (*read)(const std::string& filename, google::protobuf::Message* proto);
-  };
-  const Form forms[] = {
-      {kTextTool, kV0Net,
-       [](const std::string& filename, google::protobuf::Message* proto) {
-         return nn::ReadProtoFromTextFile(filename, proto);
-       }},
-      {kBinaryTool, ParseText(kV0Net).SerializeAsString(),
-       [](const std::string& filename, google::protobuf::Message* proto) {
-         return nn::ReadProtoFromBinaryFile(filename.c_str(), proto);
-       }},
-  };
-  for (const Form& form : forms) {
-    SCOPED_TRACE(form.tool);
+  const nn::NetParameter v0 = Parse(R"(name: "old" input: "data"
+    layers { layer { name: "pad" type: "padding" pad: 1 } bottom: "data" top: "padded" }
+    layers { layer { name: "conv" type: "conv" meanfile: "stray" }
+             bottom: "padded" top: "conv" })");
+  for (const bool binary : {false, true}) {
+    const char* tool = binary ? kBinaryTool : kTextTool;
+    SCOPED_TRACE(tool);
     TempDir dir;
+    std::string old_file = v0.SerializeAsString();
+    if (!binary) {
+      google::protobuf::TextFormat::PrintToString(v0, &old_file);
+    }
     const std::string upgraded = dir.path() + "/upgraded";
-    const ToolRun run = RunTool(form.tool, {dir.write("old", form.old_file), upgraded}, dir);
-    EXPECT_EQ(run.exit_status, 0);
-    EXPECT_THAT(run.errors, HasSubstr("Unknown parameter meanfile for layer type conv"));
-
+    std::string errors;
+    EXPECT_EQ(RunTool(tool, {dir.write("old", old_file), upgraded}, dir, &errors), 0);
+    EXPECT_THAT(errors, HasSubstr("Unknown parameter meanfile for layer type conv"));
     nn::NetParameter written;
-    ASSERT_TRUE(form.read(upgraded, &written));
-    EXPECT_EQ(written.DebugString(), ParseText(kCurrentNet).DebugString());
+    ASSERT_TRUE(binary ? nn::ReadProtoFromBinaryFile(upgraded.c_str(), &written)
+                       : nn::ReadProtoFromTextFile(upgraded, &written));
+    EXPECT_EQ(written.DebugString(), Parse(kCurrentNet).DebugString());
 
     // A current file goes through unchanged.
-    const std::string again = dir.path() + "/again";
-    EXPECT_EQ(RunTool(form.tool, {upgraded, again}, dir).exit_status, 0);
-    EXPECT_EQ(ReadFile(again), ReadFile(upgraded));
+    EXPECT_EQ(RunTool(tool, {upgraded, dir.path() + "/again"}, dir, &errors), 0);
+    EXPECT_EQ(ReadFile(dir.path() + "/again"), ReadFile(upgraded));
   }
-}
-
-void ExpectRefusal(const std::string& tool, const std::vector<std::string>& args,
-                   const TempDir& dir, const std::string& message) {
-  const ToolRun run = RunTool(tool, args, dir);
-  EXPECT_NE(run.exit_status, 0) << message;
-  EXPECT_THAT(run.errors, HasSubstr(message));
 }
 
 TEST(UpgradeNetProtoTest, ToolsRefuseWrongArgumentsAndUnusableFiles) {
   TempDir dir;
   const std::string text = dir.write("net.prototxt", kCurrentNet);
-  const std::string binary = dir.write("net.binaryproto", std::string("\xff\xff\xff", 3));
-  const std::string output = dir.path() + "/out";
-
-  for (const char* tool : {kTextTool, kBinaryTool}) {
-    const std::string name = std::filesystem::path(tool).filename().string();
-    for (const std::vector<std::string>& args :
-         {std::vector<std::string>{}, {text}, {text, output, output}}) {
-      ExpectRefusal(tool, args, dir, "Usage: " + name + " INPUT OUTPUT");
-    }
-    const std::string missing = dir.path() + "/missing";
-    ExpectRefusal(tool, {missing, output}, dir, name + ": cannot read " + missing);
-    ExpectRefusal(tool, {dir.path(), output}, dir, name + ": cannot read " + dir.path() + "\n");
-  }
-  ExpectRefusal(kTextTool, {binary, output}, dir, binary + " is not a network text description");
-  ExpectRefusal(kBinaryTool, {text, output}, dir, text + " is not a network binary weight file");
-  EXPECT_FALSE(std::filesystem::exists(output)) << "nothing is written on failure";
-
+  const std::string binary = dir.write("net.binaryproto", "\xff\xff\xff");
+  const std::string out = dir.path() + "/out";
   const std::string unwritable = dir.path() + "/no/such/folder";
-  ExpectRefusal(kTextTool, {text, unwritable}, dir, "cannot write " + unwritable);
+  const struct {
+    const char* tool;
+    std::vector<std::string> args;
+    std::string message;
+  } cases[] = {
+      {kTextTool, {}, "Usage: upgrade_net_proto_text.bin INPUT OUTPUT"},
+      {kBinaryTool, {text, out, out}, "Usage: upgrade_net_proto_binary.bin INPUT OUTPUT"},
+      // A folder would read as an empty net.
+      {kTextTool, {dir.path(), out},
+       "upgrade_net_proto_text.bin: cannot read " + dir.path() + "\n"},
+      {kTextTool, {binary, out}, binary + " is not a network text description"},
+      {kBinaryTool, {text, out}, text + " is not a network binary weight file"},
+      {kTextTool, {text, unwritable}, "cannot write " + unwritable},
+  };
+  for (const auto& c : cases) {
+    std::string errors;
+    EXPECT_NE(RunTool(c.tool, c.args, dir, &errors), 0) << c.message;
+    EXPECT_THAT(errors, HasSubstr(c.message));
+  }
+  EXPECT_FALSE(std::filesystem::exists(out)) << "nothing is written on failure";
 }
 
 }  // namespace
