@@ -19,4 +19,5 @@ apt-get install -y --no-install-recommends \
   libopenblas-dev \
   libleveldb-dev libsnappy-dev \
   libgtest-dev libgmock-dev \
-  libbenchmark-dev
+  libbenchmark-dev \
+  libboost-program-options-dev liblapacke-dev nlohmann-json3-dev

@@ -33,8 +33,17 @@ void primeFirstNet(nn::Net<float>& net) {
   firstLayer->CheckBinarization();
 }
 
-// File names are appended to the folder as it stands; a folder ending in a
-// separator gives a doubled one, which is harmless.
+CascadeStage loadBuiltInStage(const std::string& text, const std::string& weights,
+                              const std::vector<double>& mean) {
+  CascadeStage stage;
+  stage.net.reset(new nn::Net<float>(text, nn::NetDescription::kText));
+  stage.net->CopyTrainedLayersFrom(weights);
+  stage.mean.assign(mean.begin(), mean.end());
+  return stage;
+}
+
+}  // namespace
+
 CascadeStage loadFullStage(const std::string& folder) {
   CascadeStage stage;
   stage.net.reset(new nn::Net<float>(folder + "/prototxt-full", nn::NetDescription::kFile));
@@ -50,17 +59,6 @@ CascadeStage loadDeployStage(const std::string& folder) {
   stage.mean = readMeanFile(folder + "/mean");
   return stage;
 }
-
-CascadeStage loadBuiltInStage(const std::string& text, const std::string& weights,
-                              const std::vector<double>& mean) {
-  CascadeStage stage;
-  stage.net.reset(new nn::Net<float>(text, nn::NetDescription::kText));
-  stage.net->CopyTrainedLayersFrom(weights);
-  stage.mean.assign(mean.begin(), mean.end());
-  return stage;
-}
-
-}  // namespace
 
 Status loadCascadeFromFolder(DetectorState& state, const DetectorParams& params) {
   boost::lock_guard<boost::mutex> lock(loadMutex);

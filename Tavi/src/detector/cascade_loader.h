@@ -1,6 +1,8 @@
 #ifndef TAVI_SRC_DETECTOR_CASCADE_LOADER_H_
 #define TAVI_SRC_DETECTOR_CASCADE_LOADER_H_
 
+#include <string>
+
 #include "detector/detector_state.h"
 #include "tavilib.h"
 
@@ -14,6 +16,13 @@ namespace tavilib {
 // the process.
 Status loadCascadeFromFolder(DetectorState& state, const DetectorParams& params);
 Status loadBuiltInCascade(DetectorState& state);
+
+// One stage folder, without the lock: in the full form (the primed scan net,
+// no mean) or the deploy form (net and mean). File names are appended to the
+// folder as it stands; a folder ending in a separator gives a doubled one,
+// which is harmless. The trainers load the stages they have so far this way.
+CascadeStage loadFullStage(const std::string& folder);
+CascadeStage loadDeployStage(const std::string& folder);
 
 }  // namespace tavilib
 

@@ -5,9 +5,12 @@
 namespace tavilib {
 
 void writeImagePlanes(const cv::Mat& image, nn::Blob<float>* blob) {
+  writeImagePlanes(image, blob->mutable_cpu_data(), blob->count());
+}
+
+void writeImagePlanes(const cv::Mat& image, float* planes, int capacity) {
   const int planeSize = image.rows * image.cols;
-  const int rows = std::min(image.rows, blob->count() / std::max(3 * image.cols, 1));
-  float* planes = blob->mutable_cpu_data();
+  const int rows = std::min(image.rows, capacity / std::max(3 * image.cols, 1));
   for (int r = 0; r < rows; ++r) {
     const unsigned char* pixel = image.ptr<unsigned char>(r);
     float* out = planes + r * image.cols;

@@ -12,6 +12,8 @@ namespace tavilib {
 // then the first. No scaling, no mean. Rows that would not fit the blob's
 // element count are left out.
 void writeImagePlanes(const cv::Mat& image, nn::Blob<float>* blob);
+// The same into capacity floats at planes, for one image of a batch.
+void writeImagePlanes(const cv::Mat& image, float* planes, int capacity);
 
 }  // namespace tavilib
 

@@ -18,15 +18,8 @@ constexpr float kCalibrationConfidence = 0.1f;
 // Cuts the window out, resizes it to the net's input, subtracts the stage's
 // mean and runs the net.
 void runOnWindow(const Window& window, CascadeStage& stage, const cv::Mat& image) {
-  // The view raises the image library's exception for a window that leaves
-  // the image.
-  const cv::Mat view = image(cv::Rect(window.x, window.y, window.width, window.height));
   nn::Blob<float>* input = stage.net->net_input_blobs()[0];
-  cv::Mat sized = view;
-  if (input->width() >= 1 && input->height() >= 1) {
-    cv::resize(view, sized, cv::Size(input->width(), input->height()), 0, 0, cv::INTER_LINEAR);
-  }
-  writeImagePlanes(sized, input);
+  writeImagePlanes(cutWindow(image, window, input->width(), input->height()), input);
   float* data = input->mutable_cpu_data();
   // A mean shorter than the input (an incomplete mean file) covers only its
   // own length.
@@ -36,6 +29,18 @@ void runOnWindow(const Window& window, CascadeStage& stage, const cv::Mat& image
 }
 
 }  // namespace
+
+cv::Mat cutWindow(const cv::Mat& image, const Window& window, int width, int height) {
+  // The view raises the image library's exception for a window that leaves
+  // the image.
+  const cv::Mat view = image(cv::Rect(window.x, window.y, window.width, window.height));
+  if (width < 1 || height < 1) {
+    return view;
+  }
+  cv::Mat sized;
+  cv::resize(view, sized, cv::Size(width, height), 0, 0, cv::INTER_LINEAR);
+  return sized;
+}
 
 std::vector<Window> gradeWindows(std::vector<Window> windows, CascadeStage& stage,
                                  const cv::Mat& image) {

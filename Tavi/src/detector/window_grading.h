@@ -10,6 +10,12 @@
 
 namespace tavilib {
 
+// The window cut from the image at full resolution and resized bilinearly to
+// width by height (when both are at least 1): what a grading net sees before
+// its mean is subtracted. The trainers cut their windows with it too.
+// REQUIRES: the window lies inside the image.
+cv::Mat cutWindow(const cv::Mat& image, const Window& window, int width, int height);
+
 // Replaces each window's score by the stage net's face probability (class 1
 // of "probs") for the window cut from the image at full resolution. Order and
 // count are kept.

@@ -20,8 +20,7 @@ namespace nn {
 // How the string handed to a Net constructor is to be read.
 enum class NetDescription { kFile, kText };
 
-// A chain of layers and blobs assembled from a network description, run
-// forward only.
+// A chain of layers and blobs assembled from a network description.
 //
 // A net is assembled once for its largest input. AlterInputShape then runs it
 // at any smaller size by rewriting shape headers; no memory moves. A net meant
@@ -64,6 +63,14 @@ class Net {
   // REQUIRES: new_width and new_height at most the declared input size (not
   //   checked: larger sizes overrun the buffers at the next pass).
   void AlterInputShape(int new_width, int new_height);
+  // Runs the layers in reverse, only those that need a gradient, from the
+  // gradients the caller wrote into the output blobs' diffs. Leaves each
+  // parameter blob's gradient in its diff.
+  // REQUIRES: a forward pass over the same input ran last.
+  void Backward();
+  // Fills param with the net's name and, for each layer holding parameter
+  // blobs, its description and blobs: the binary weight-file form.
+  void ToProto(NetParameter* param) const;
 
   // The blob named "probs"; empty if the net has none.
   boost::shared_ptr<Blob<Dtype>> output_blob() const;
@@ -78,6 +85,10 @@ class Net {
   const std::vector<std::vector<Blob<Dtype>*>>& bottom_vecs() const { return bottom_vecs_; }
   const std::vector<std::vector<Blob<Dtype>*>>& top_vecs() const { return top_vecs_; }
   const std::vector<bool>& layer_need_backward() const { return layer_need_backward_; }
+  // Per parameter blob, parallel to params(): the description's learning-rate
+  // and weight-decay multipliers (1 where it gives none).
+  const std::vector<float>& params_lr() const { return params_lr_; }
+  const std::vector<float>& params_weight_decay() const { return params_weight_decay_; }
   const std::string& name() const { return name_; }
 
  private:

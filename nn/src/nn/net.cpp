@@ -290,6 +290,31 @@ void Net<Dtype>::AlterInputShape(int new_width, int new_height) {
 }
 
 template <typename Dtype>
+void Net<Dtype>::Backward() {
+  for (int i = static_cast<int>(layers_.size()) - 1; i >= 0; --i) {
+    if (!layer_need_backward_[i]) {
+      continue;
+    }
+    bool propagate_down = false;
+    for (int id : bottom_id_vecs_[i]) {
+      propagate_down = propagate_down || blob_need_backward_[id];
+    }
+    layers_[i]->Backward(top_vecs_[i], propagate_down, &bottom_vecs_[i]);
+  }
+}
+
+template <typename Dtype>
+void Net<Dtype>::ToProto(NetParameter* param) const {
+  param->Clear();
+  param->set_name(name_);
+  for (const auto& layer : layers_) {
+    if (!layer->blobs().empty()) {
+      layer->ToProto(param->add_layers());
+    }
+  }
+}
+
+template <typename Dtype>
 boost::shared_ptr<Blob<Dtype>> Net<Dtype>::output_blob() const {
   auto found = blob_names_index_.find(kOutputBlobName);
   if (found == blob_names_index_.end()) {

@@ -1,0 +1,249 @@
+// Measures a cascade model folder on the held-out validation data:
+//
+//   build/tools/evaluate_detector --model Tavi/public/ --data ../shared/data/ --min-face 20
+//       --curve docs/detector_validation.png
+//
+// Recall of the faces68 val faces (a detection with an IoU of at least 0.5
+// with the face box; other faces in those frames may be unlabelled, so no
+// false positives are counted there), false positives per held-out negative
+// image and per megapixel, the windows each stage takes in and lets out, NaN
+// scores of the scan, and the curve of recall against false positives per
+// image over the final scores, drawn as a PNG.
+#include <boost/program_options.hpp>
+
+#include <opencv2/imgcodecs.hpp>
+#include <opencv2/imgproc.hpp>
+
+#include <algorithm>
+#include <cmath>
+#include <cstdio>
+#include <iostream>
+#include <string>
+#include <vector>
+
+#include "detector/cascade_driver.h"
+#include "detector/cascade_loader.h"
+#include "detector/pyramid_scan.h"
+#include "detector/window_grading.h"
+#include "detector_training/face_box.h"
+#include "detector_training/scan_settings.h"
+#include "detector_training/training_data.h"
+#include "nn/net.h"
+
+namespace po = boost::program_options;
+using tavilib::Window;
+
+namespace {
+
+constexpr float kMatchIoU = 0.5f;
+
+// Windows seen by each stage over a set of images.
+struct StageCounts {
+  std::vector<double> in;
+  std::vector<double> out;
+  long nanScores = 0;
+};
+
+// Runs the cascade through the detector's own driver, counting the windows
+// that enter each stage and leave it.
+std::vector<tavilib::Detection> detectCounting(tavilib::DetectorState& state, const cv::Mat& image,
+                                               int minFace, StageCounts& counts) {
+  const int declared = state.stages[0].net->net_input_blobs()[0]->width();
+  const tavilib::CascadeParameter settings =
+      training::scanSettingsFor(image.cols, image.rows, minFace, declared);
+  const size_t stages = state.stages.size();
+  counts.in.resize(stages, 0.0);
+  counts.out.resize(stages, 0.0);
+  tavilib::CascadeSteps steps;
+  steps.scan = [&](const cv::Mat& input, const tavilib::CascadeParameter& params,
+                   tavilib::CascadeStage& first) {
+    tavilib::PyramidScan scan = tavilib::scanPyramid(input, params, first);
+    counts.in[0] += static_cast<double>(scan.windows.size());
+    for (const Window& window : scan.windows) {
+      counts.nanScores += std::isnan(window.score);
+    }
+    return scan;
+  };
+  steps.grade = [&](std::vector<Window> windows, tavilib::CascadeStage& stage,
+                    const cv::Mat& input) {
+    const size_t s = static_cast<size_t>(&stage - state.stages.data());
+    counts.in[s] += static_cast<double>(windows.size());
+    counts.out[s - 1] += static_cast<double>(windows.size());
+    return tavilib::gradeWindows(std::move(windows), stage, input);
+  };
+  steps.calibrate = tavilib::calibrateWindows;
+  tavilib::Image wrapped{image.cols, image.rows, static_cast<int>(image.step), image.data};
+  std::vector<tavilib::Detection> detections;
+  tavilib::runCascade(wrapped, state, detections, settings, steps);
+  counts.out[stages - 1] += static_cast<double>(detections.size());
+  return detections;
+}
+
+cv::Rect2f boxOf(const tavilib::Detection& detection) {
+  return cv::Rect2f(detection.box.left, detection.box.top, detection.box.right - detection.box.left,
+                    detection.box.bottom - detection.box.top);
+}
+
+void printCounts(const char* what, const StageCounts& counts, size_t images) {
+  for (size_t s = 0; s < counts.in.size(); ++s) {
+    std::printf("  %s, stage %zu: %.1f windows in, %.1f out per image (pass rate %.4f)\n", what, s,
+                counts.in[s] / static_cast<double>(images), counts.out[s] / static_cast<double>(images),
+                counts.in[s] > 0 ? counts.out[s] / counts.in[s] : 0.0);
+  }
+}
+
+// Recall against false positives per negative image, one point per final
+// score taken as a threshold, on log-scaled false positives.
+void drawCurve(const std::vector<float>& faceScores, size_t faces,
+               const std::vector<float>& falseScores, size_t negativeImages,
+               const std::string& path) {
+  std::vector<float> thresholds = faceScores;
+  thresholds.insert(thresholds.end(), falseScores.begin(), falseScores.end());
+  std::sort(thresholds.begin(), thresholds.end(), std::greater<float>());
+  const int width = 640;
+  const int height = 480;
+  const int margin = 60;
+  cv::Mat canvas(height, width, CV_8UC3, cv::Scalar(255, 255, 255));
+  const double lowFp = 1e-3;
+  const double highFp = 10.0;
+  auto toPoint = [&](double fp, double recall) {
+    const double x = (std::log10(std::max(fp, lowFp)) - std::log10(lowFp)) /
+                     (std::log10(highFp) - std::log10(lowFp));
+    return cv::Point(margin + static_cast<int>(x * (width - 2 * margin)),
+                     height - margin - static_cast<int>(recall * (height - 2 * margin)));
+  };
+  cv::rectangle(canvas, toPoint(lowFp, 0.0), toPoint(highFp, 1.0), cv::Scalar(0, 0, 0));
+  for (double fp : {1e-3, 1e-2, 1e-1, 1.0, 10.0}) {
+    char label[16];
+    std::snprintf(label, sizeof label, "%g", fp);
+    cv::putText(canvas, label, toPoint(fp, 0.0) + cv::Point(-10, 20), cv::FONT_HERSHEY_SIMPLEX,
+                0.45, cv::Scalar(0, 0, 0));
+  }
+  for (double recall = 0.0; recall <= 1.0001; recall += 0.2) {
+    char label[16];
+    std::snprintf(label, sizeof label, "%.1f", recall);
+    cv::putText(canvas, label, toPoint(lowFp, recall) + cv::Point(-40, 5),
+                cv::FONT_HERSHEY_SIMPLEX, 0.45, cv::Scalar(0, 0, 0));
+  }
+  cv::putText(canvas, "false positives per negative image", cv::Point(margin + 120, height - 15),
+              cv::FONT_HERSHEY_SIMPLEX, 0.5, cv::Scalar(0, 0, 0));
+  cv::putText(canvas, "recall of faces68 val", cv::Point(margin, margin - 20),
+              cv::FONT_HERSHEY_SIMPLEX, 0.5, cv::Scalar(0, 0, 0));
+  cv::Point previous;
+  bool started = false;
+  for (float threshold : thresholds) {
+    const double found = static_cast<double>(
+        std::count_if(faceScores.begin(), faceScores.end(), [&](float s) { return s >= threshold; }));
+    const double wrong = static_cast<double>(std::count_if(
+        falseScores.begin(), falseScores.end(), [&](float s) { return s >= threshold; }));
+    const cv::Point point = toPoint(wrong / static_cast<double>(negativeImages),
+                                    found / static_cast<double>(faces));
+    if (started) {
+      cv::line(canvas, previous, point, cv::Scalar(200, 60, 0), 2);
+    }
+    previous = point;
+    started = true;
+  }
+  if (!cv::imwrite(path, canvas)) {
+    throw std::runtime_error("cannot write " + path);
+  }
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  std::string model;
+  std::string list;
+  std::string dataRoot;
+  std::string curve;
+  int minFace = 20;
+  po::options_description described("evaluate_detector: the cascade on the held-out validation");
+  described.add_options()("help", "this text")(
+      "model", po::value<std::string>(&model)->default_value("Tavi/public/"),
+      "the model folder (ending in a separator)")(
+      "list", po::value<std::string>(&list)->default_value("cascade.list"), "its list file")(
+      "data", po::value<std::string>(&dataRoot)->default_value("../shared/data/"),
+      "the data folder (ending in a separator)")(
+      "min-face", po::value<int>(&minFace)->default_value(20), "smallest face sought, pixels")(
+      "curve", po::value<std::string>(&curve)->default_value(""),
+      "write the recall curve to this PNG");
+  try {
+    po::variables_map values;
+    po::store(po::parse_command_line(argc, argv, described), values);
+    if (values.count("help") > 0) {
+      std::cout << described << "\n";
+      return 0;
+    }
+    po::notify(values);
+
+    const training::DetectorData validation = training::loadValidationData(dataRoot);
+    tavilib::DetectorState state;
+    const tavilib::DetectorParams where(model.c_str(), list.c_str());
+    if (tavilib::loadCascadeFromFolder(state, where) != tavilib::STATUS_OK) {
+      throw std::runtime_error("cannot load the cascade " + model + list);
+    }
+    state.ready = true;
+    const int declared = state.stages[0].net->net_input_blobs()[0]->width();
+    std::printf("scan settings: minimum face %d px (more where a base image would exceed the "
+                "scan net's %d px), scale step %g, window %d, no enlargement\n",
+                minFace, declared, static_cast<double>(training::kScaleStep),
+                training::kWindowSize);
+
+    StageCounts faceCounts;
+    std::vector<float> faceScores;
+    size_t missed = 0;
+    for (const training::FaceImage& face : validation.faces) {
+      float best = -1.0f;
+      for (const tavilib::Detection& detection :
+           detectCounting(state, face.pixels, minFace, faceCounts)) {
+        if (training::intersectionOverUnion(boxOf(detection), face.box) >= kMatchIoU) {
+          best = std::max(best, detection.score);
+        }
+      }
+      if (best >= 0.0f) {
+        faceScores.push_back(best);
+      } else {
+        ++missed;
+      }
+    }
+    StageCounts negativeCounts;
+    std::vector<float> falseScores;
+    double megapixels = 0.0;
+    int largestMinFace = minFace;
+    for (const cv::Mat& image : validation.negatives) {
+      megapixels += static_cast<double>(image.total()) / 1e6;
+      largestMinFace = std::max(
+          largestMinFace, training::minimumFaceOf(training::scanSettingsFor(image.cols, image.rows,
+                                                                            minFace, declared),
+                                                  image.cols, image.rows));
+      for (const tavilib::Detection& detection :
+           detectCounting(state, image, minFace, negativeCounts)) {
+        falseScores.push_back(detection.score);
+      }
+    }
+    const size_t faces = validation.faces.size();
+    const size_t negatives = validation.negatives.size();
+    std::printf("faces68 val: %zu faces, %zu found, recall %.4f\n", faces, faces - missed,
+                static_cast<double>(faces - missed) / static_cast<double>(faces));
+    std::printf("held-out negatives: %zu images (%.2f megapixels; minimum face up to %d px), %zu "
+                "false positives: %.4f per image, %.4f per megapixel\n",
+                negatives, megapixels, largestMinFace, falseScores.size(),
+                static_cast<double>(falseScores.size()) / static_cast<double>(negatives),
+                static_cast<double>(falseScores.size()) / megapixels);
+    printCounts("face images", faceCounts, faces);
+    printCounts("negative images", negativeCounts, negatives);
+    std::printf("NaN scan scores: %ld on face images, %ld on negative images\n",
+                faceCounts.nanScores, negativeCounts.nanScores);
+    if (!curve.empty()) {
+      drawCurve(faceScores, faces, falseScores, negatives, curve);
+      std::printf("curve written to %s\n", curve.c_str());
+    }
+  } catch (const po::error& error) {
+    std::cerr << "evaluate_detector: " << error.what() << "\n" << described << "\n";
+    return 2;
+  } catch (const std::exception& error) {
+    std::cerr << "evaluate_detector: " << error.what() << "\n";
+    return 1;
+  }
+  return 0;
+}
