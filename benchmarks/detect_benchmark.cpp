@@ -1,118 +1,131 @@
-// detect on a 640x480 image with the built-in cascade at its declared sizes,
-// weights from the fillers, split into the pyramid scan, the grading by the
-// window nets and the calibration.
+// detect with the shipped cascade (Tavi/public/cascade.list) on a 640 by 480
+// photo, split into the pyramid scan, the grading by each window net and
+// the calibration:
 //
 //   OPENBLAS_NUM_THREADS=1 build/benchmarks/detect_benchmark
 //
-// The counters give how many windows each part handles. With filled weights
-// every scan window scores near 0.5: all pass the first threshold, none the
-// second, so grading and calibration see the scan's full list.
+// The photo is TAVI_BENCHMARK_PHOTO when that names an image (scaled to
+// 640 by 480), else one made from the data folder: a negatives/ scene with
+// three faces68 val frames of different sizes set into it. The counters give
+// the windows each stage takes in per call.
 #include <benchmark/benchmark.h>
 
-#include <opencv2/core.hpp>
+#include <opencv2/imgcodecs.hpp>
+#include <opencv2/imgproc.hpp>
 
-#include <random>
+#include <cstdlib>
+#include <fstream>
+#include <iostream>
+#include <string>
 #include <vector>
 
 #include "detector/cascade_driver.h"
-#include "detector/default_cascade_tables.h"
+#include "detector/cascade_loader.h"
 #include "detector/pyramid_scan.h"
-#include "detector/window_filter.h"
 #include "detector/window_grading.h"
-#include "nn/net.h"
+#include "detector_training/cascade_recorder.h"
+#include "detector_training/counted_detection.h"
+#include "detector_training/training_data.h"
 
 namespace {
 
 using tavilib::CascadeParameter;
-using tavilib::CascadeStage;
 using tavilib::DetectorState;
 using tavilib::Window;
 
-const CascadeParameter kParams{1.0f, 640, 0.05f, 6, 1.3f, 12};
+const char kDataRoot[] = TAVI_SOURCE_DIR "/../shared/data/";
 
-CascadeStage StageFrom(const std::string& text, const std::vector<double>& mean) {
-  CascadeStage stage;
-  stage.net.reset(new nn::Net<float>(text, nn::NetDescription::kText));
-  stage.mean.assign(mean.begin(), mean.end());
-  return stage;
+// Faces of minFace pixels and up in a 640 by 480 photo.
+CascadeParameter ScanFor(int minFace) {
+  return CascadeParameter{1.0f, 640, (static_cast<float>(minFace) + 0.5f) / 640.0f, 30, 1.2f, 12};
 }
 
-// The built-in cascade with the weights its fillers give.
-DetectorState& BuiltInState() {
+DetectorState& Shipped() {
   static DetectorState* state = [] {
-    const tavilib::DefaultCascadeTables tables;
-    auto* built = new DetectorState();
-    built->stages.push_back(StageFrom(tables.stage0NetText, {}));
-    built->stages[0].net->FirstRun();
-    built->stages.push_back(StageFrom(tables.stage1NetText, tables.stage1Mean));
-    built->stages.push_back(StageFrom(tables.stage2NetText, tables.stage2Mean));
-    for (int i = 0; i < 3; ++i) {
-      built->stages[i].threshold = static_cast<float>(tables.thresholds[i]);
+    auto* loaded = new DetectorState();
+    const tavilib::DetectorParams where(TAVI_SOURCE_DIR "/Tavi/public/", "cascade.list");
+    if (tavilib::loadCascadeFromFolder(*loaded, where) != tavilib::STATUS_OK) {
+      std::cerr << "no cascade at " << where.cascadeRoot << where.cascadeList << "\n";
+      std::exit(1);
     }
-    built->calibration = StageFrom(tables.calibrationNetText, tables.calibrationMean);
-    for (size_t i = 0; i < tables.offsetsX.size(); ++i) {
-      built->calibration.offsetsScales.push_back(
-          {tables.offsetsX[i], tables.offsetsY[i], static_cast<float>(tables.scales[i])});
-    }
-    built->ready = true;
-    return built;
+    loaded->ready = true;
+    return loaded;
   }();
   return *state;
 }
 
-cv::Mat& TestImage() {
-  static cv::Mat image = [] {
-    cv::Mat pixels(480, 640, CV_8UC3);
-    std::mt19937 generator(1);
-    for (auto it = pixels.begin<cv::Vec3b>(); it != pixels.end<cv::Vec3b>(); ++it) {
-      *it = cv::Vec3b(generator() % 256, generator() % 256, generator() % 256);
-    }
-    return pixels;
-  }();
-  return image;
+cv::Mat MadePhoto() {
+  const std::vector<training::LabelledFace> faces =
+      training::readLabelledFaces(std::string(kDataRoot) + "faces68/val.csv");
+  std::vector<cv::String> scenes;
+  cv::glob(std::string(kDataRoot) + "negatives/images/*.jpg", scenes, false);
+  cv::Mat photo;
+  cv::resize(training::readImage(scenes.at(0)), photo, cv::Size(640, 480), 0, 0, cv::INTER_AREA);
+  const int heights[] = {220, 150, 100};
+  const cv::Point places[] = {{30, 200}, {300, 60}, {500, 330}};
+  for (int i = 0; i < 3; ++i) {
+    const cv::Mat frame =
+        training::readImage(std::string(kDataRoot) + "faces68/" + faces.at(10 * i).file);
+    cv::Mat sized;
+    cv::resize(frame, sized, cv::Size(frame.cols * heights[i] / frame.rows, heights[i]), 0, 0,
+               cv::INTER_AREA);
+    const cv::Rect place = cv::Rect(places[i], sized.size()) & cv::Rect(0, 0, 640, 480);
+    sized(cv::Rect(0, 0, place.width, place.height)).copyTo(photo(place));
+  }
+  return photo;
 }
 
-// The scan's windows in the input frame, above the first threshold.
-std::vector<Window> FirstStageWindows() {
-  const tavilib::PyramidScan scan =
-      tavilib::scanPyramid(TestImage(), kParams, BuiltInState().stages[0]);
-  std::vector<Window> windows = scan.windows;
-  const float factor = 1.0f / scan.baseScale;
-  for (Window& w : windows) {
-    w.x = static_cast<int32_t>(w.x * factor);
-    w.y = static_cast<int32_t>(w.y * factor);
-    w.width = static_cast<int32_t>(w.width * factor);
-    w.height = static_cast<int32_t>(w.height * factor);
-  }
-  return tavilib::keepAboveThreshold(windows, BuiltInState().stages[0].threshold);
+cv::Mat& Photo() {
+  static cv::Mat photo = [] {
+    const char* path = std::getenv("TAVI_BENCHMARK_PHOTO");
+    if (path == nullptr) {
+      return MadePhoto();
+    }
+    cv::Mat sized;
+    cv::resize(training::readImage(path), sized, cv::Size(640, 480), 0, 0, cv::INTER_AREA);
+    return sized;
+  }();
+  return photo;
 }
 
 void BM_Detect(benchmark::State& state) {
-  cv::Mat& image = TestImage();
-  const tavilib::Image input{image.cols, image.rows, 0, image.data};
-  const tavilib::CascadeSteps steps{tavilib::scanPyramid, tavilib::gradeWindows,
-                                    tavilib::calibrateWindows};
+  const CascadeParameter scan = ScanFor(static_cast<int>(state.range(0)));
   std::vector<tavilib::Detection> detections;
   for (auto _ : state) {
     detections.clear();
-    tavilib::runCascade(input, BuiltInState(), detections, kParams, steps);
+    tavilib::runCascade({Photo().cols, Photo().rows, 0, Photo().data}, Shipped(), detections, scan,
+                        {tavilib::scanPyramid, tavilib::gradeWindows, tavilib::calibrateWindows});
   }
-  state.counters["detections"] = static_cast<double>(detections.size());
+  training::StageCounts counts;
+  training::detectCounting(Shipped(), Photo(), scan, counts);
+  for (size_t s = 0; s < counts.in.size(); ++s) {
+    state.counters["stage" + std::to_string(s) + "_in"] = counts.in[s];
+  }
+  state.counters["faces"] = static_cast<double>(detections.size());
 }
 
 void BM_Scan(benchmark::State& state) {
+  const CascadeParameter scan = ScanFor(static_cast<int>(state.range(0)));
   size_t windows = 0;
   for (auto _ : state) {
-    windows = tavilib::scanPyramid(TestImage(), kParams, BuiltInState().stages[0]).windows.size();
+    windows = tavilib::scanPyramid(Photo(), scan, Shipped().stages[0]).windows.size();
   }
   state.counters["windows"] = static_cast<double>(windows);
 }
 
+// The windows that stage `stage` grades in a detection of faces of 40 and up.
+std::vector<Window> WindowsOfStage(size_t stage) {
+  DetectorState before;
+  before.stages.assign(Shipped().stages.begin(), Shipped().stages.begin() + stage);
+  before.calibration = Shipped().calibration;
+  return training::windowsForNextStage(before, Photo(), ScanFor(40));
+}
+
 void BM_Grade(benchmark::State& state) {
-  const std::vector<Window> windows = FirstStageWindows();
-  CascadeStage& stage = BuiltInState().stages[state.range(0)];
+  const size_t stage = static_cast<size_t>(state.range(0));
+  const std::vector<Window> windows = WindowsOfStage(stage);
   for (auto _ : state) {
-    benchmark::DoNotOptimize(tavilib::gradeWindows(windows, stage, TestImage()));
+    benchmark::DoNotOptimize(tavilib::gradeWindows(windows, Shipped().stages[stage], Photo()));
   }
   state.counters["windows"] = static_cast<double>(windows.size());
   state.counters["per_window_us"] = benchmark::Counter(
@@ -121,16 +134,47 @@ void BM_Grade(benchmark::State& state) {
 }
 
 void BM_Calibrate(benchmark::State& state) {
-  const std::vector<Window> windows = FirstStageWindows();
+  const std::vector<Window> windows = WindowsOfStage(1);
   for (auto _ : state) {
     benchmark::DoNotOptimize(
-        tavilib::calibrateWindows(windows, BuiltInState().calibration, TestImage()));
+        tavilib::calibrateWindows(windows, Shipped().calibration, Photo()));
   }
   state.counters["windows"] = static_cast<double>(windows.size());
 }
 
-BENCHMARK(BM_Detect)->Unit(benchmark::kMillisecond);
-BENCHMARK(BM_Scan)->Unit(benchmark::kMillisecond);
+long ResidentKiB() {
+  std::ifstream status("/proc/self/status");
+  std::string key;
+  long value = 0;
+  while (status >> key) {
+    if (key == "VmRSS:") {
+      status >> value;
+      break;
+    }
+  }
+  return value;
+}
+
+// What a loaded Detector holds once it has scanned a 1920 by 1080 photo for
+// faces of 40 pixels and up (a base image of 576 by 324): the nets, their
+// blobs and the scan net's stored response.
+void BM_LoadedDetectorMemory(benchmark::State& state) {
+  cv::Mat large;
+  cv::resize(Photo(), large, cv::Size(1920, 1080));
+  for (auto _ : state) {
+    const long before = ResidentKiB();
+    tavilib::Detector detector;
+    detector.load(tavilib::DetectorParams(TAVI_SOURCE_DIR "/Tavi/public/", "cascade.list"));
+    std::vector<tavilib::Detection> faces;
+    tavilib::detect({large.cols, large.rows, 0, large.data}, detector, faces,
+                    CascadeParameter{1.0f, 1920, 40.5f / 1920.0f, 30, 1.2f, 12});
+    state.counters["resident_MB"] = static_cast<double>(ResidentKiB() - before) / 1024.0;
+  }
+}
+
+BENCHMARK(BM_LoadedDetectorMemory)->Iterations(1)->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_Detect)->Arg(40)->Arg(20)->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_Scan)->Arg(40)->Arg(20)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_Grade)->Arg(1)->Arg(2)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_Calibrate)->Unit(benchmark::kMillisecond);
 

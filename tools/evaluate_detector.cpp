@@ -11,6 +11,7 @@
 // image over the final scores, drawn as a PNG.
 #include <boost/program_options.hpp>
 
+#include <cblas.h>
 #include <opencv2/imgcodecs.hpp>
 #include <opencv2/imgproc.hpp>
 
@@ -21,70 +22,58 @@
 #include <string>
 #include <vector>
 
-#include "detector/cascade_driver.h"
 #include "detector/cascade_loader.h"
-#include "detector/pyramid_scan.h"
-#include "detector/window_grading.h"
+#include "detector_training/cascade_recorder.h"
+#include "detector_training/counted_detection.h"
 #include "detector_training/face_box.h"
+#include "detector_training/parallel_items.h"
 #include "detector_training/scan_settings.h"
 #include "detector_training/training_data.h"
 #include "nn/net.h"
 
 namespace po = boost::program_options;
-using tavilib::Window;
 
 namespace {
 
 constexpr float kMatchIoU = 0.5f;
-
-// Windows seen by each stage over a set of images.
-struct StageCounts {
-  std::vector<double> in;
-  std::vector<double> out;
-  long nanScores = 0;
-};
-
-// Runs the cascade through the detector's own driver, counting the windows
-// that enter each stage and leave it.
-std::vector<tavilib::Detection> detectCounting(tavilib::DetectorState& state, const cv::Mat& image,
-                                               int minFace, StageCounts& counts) {
-  const int declared = state.stages[0].net->net_input_blobs()[0]->width();
-  const tavilib::CascadeParameter settings =
-      training::scanSettingsFor(image.cols, image.rows, minFace, declared);
-  const size_t stages = state.stages.size();
-  counts.in.resize(stages, 0.0);
-  counts.out.resize(stages, 0.0);
-  tavilib::CascadeSteps steps;
-  steps.scan = [&](const cv::Mat& input, const tavilib::CascadeParameter& params,
-                   tavilib::CascadeStage& first) {
-    tavilib::PyramidScan scan = tavilib::scanPyramid(input, params, first);
-    counts.in[0] += static_cast<double>(scan.windows.size());
-    for (const Window& window : scan.windows) {
-      counts.nanScores += std::isnan(window.score);
-    }
-    return scan;
-  };
-  steps.grade = [&](std::vector<Window> windows, tavilib::CascadeStage& stage,
-                    const cv::Mat& input) {
-    const size_t s = static_cast<size_t>(&stage - state.stages.data());
-    counts.in[s] += static_cast<double>(windows.size());
-    counts.out[s - 1] += static_cast<double>(windows.size());
-    return tavilib::gradeWindows(std::move(windows), stage, input);
-  };
-  steps.calibrate = tavilib::calibrateWindows;
-  tavilib::Image wrapped{image.cols, image.rows, static_cast<int>(image.step), image.data};
-  std::vector<tavilib::Detection> detections;
-  tavilib::runCascade(wrapped, state, detections, settings, steps);
-  counts.out[stages - 1] += static_cast<double>(detections.size());
-  return detections;
-}
 
 cv::Rect2f boxOf(const tavilib::Detection& detection) {
   return cv::Rect2f(detection.box.left, detection.box.top, detection.box.right - detection.box.left,
                     detection.box.bottom - detection.box.top);
 }
 
-void printCounts(const char* what, const StageCounts& counts, size_t images) {
+// The windows that pass the first `stages` stages, as the next stage gets them.
+std::vector<tavilib::Window> windowsAfter(const tavilib::DetectorState& state, size_t stages,
+                                          const cv::Mat& image,
+                                          const tavilib::CascadeParameter& settings) {
+  tavilib::DetectorState before;
+  before.stages.assign(state.stages.begin(), state.stages.begin() + stages);
+  before.calibration = state.calibration;
+  return training::windowsForNextStage(before, image, settings);
+}
+
+// What one validation image gave: windows per stage, the scores of the
+// detections (of a face image: the best one matching its face, if any), and
+// for a face image whether a matching window survived each stage but the
+// last.
+struct ImageResult {
+  training::StageCounts counts;
+  std::vector<float> scores;
+  std::vector<bool> kept;
+};
+
+bool hasMatch(const std::vector<tavilib::Window>& windows, const cv::Rect2f& face) {
+  for (const tavilib::Window& window : windows) {
+    const cv::Rect2f box(static_cast<float>(window.x), static_cast<float>(window.y),
+                         static_cast<float>(window.width), static_cast<float>(window.height));
+    if (training::intersectionOverUnion(box, face) >= kMatchIoU) {
+      return true;
+    }
+  }
+  return false;
+}
+
+void printCounts(const char* what, const training::StageCounts& counts, size_t images) {
   for (size_t s = 0; s < counts.in.size(); ++s) {
     std::printf("  %s, stage %zu: %.1f windows in, %.1f out per image (pass rate %.4f)\n", what, s,
                 counts.in[s] / static_cast<double>(images), counts.out[s] / static_cast<double>(images),
@@ -157,6 +146,7 @@ int main(int argc, char** argv) {
   std::string dataRoot;
   std::string curve;
   int minFace = 20;
+  int threads = 2;
   po::options_description described("evaluate_detector: the cascade on the held-out validation");
   described.add_options()("help", "this text")(
       "model", po::value<std::string>(&model)->default_value("Tavi/public/"),
@@ -166,7 +156,8 @@ int main(int argc, char** argv) {
       "the data folder (ending in a separator)")(
       "min-face", po::value<int>(&minFace)->default_value(20), "smallest face sought, pixels")(
       "curve", po::value<std::string>(&curve)->default_value(""),
-      "write the recall curve to this PNG");
+      "write the recall curve to this PNG")(
+      "threads", po::value<int>(&threads)->default_value(2), "images measured at once");
   try {
     po::variables_map values;
     po::store(po::parse_command_line(argc, argv, described), values);
@@ -176,53 +167,84 @@ int main(int argc, char** argv) {
     }
     po::notify(values);
 
+    // The nets run one window at a time, where the matrix library's own
+    // threads cost more than they give; the workers share out the images.
+    openblas_set_num_threads(1);
     const training::DetectorData validation = training::loadValidationData(dataRoot);
-    tavilib::DetectorState state;
+    // One copy of the cascade per worker: a net serves one thread at a time.
+    std::vector<tavilib::DetectorState> states(static_cast<size_t>(std::max(threads, 1)));
     const tavilib::DetectorParams where(model.c_str(), list.c_str());
-    if (tavilib::loadCascadeFromFolder(state, where) != tavilib::STATUS_OK) {
-      throw std::runtime_error("cannot load the cascade " + model + list);
+    for (tavilib::DetectorState& state : states) {
+      if (tavilib::loadCascadeFromFolder(state, where) != tavilib::STATUS_OK) {
+        throw std::runtime_error("cannot load the cascade " + model + list);
+      }
+      state.ready = true;
     }
-    state.ready = true;
-    const int declared = state.stages[0].net->net_input_blobs()[0]->width();
+    const size_t stages = states[0].stages.size();
+    const int declared = states[0].stages[0].net->net_input_blobs()[0]->width();
     std::printf("scan settings: minimum face %d px (more where a base image would exceed the "
                 "scan net's %d px), scale step %g, window %d, no enlargement\n",
                 minFace, declared, static_cast<double>(training::kScaleStep),
                 training::kWindowSize);
+    auto settingsFor = [&](const cv::Mat& image) {
+      return training::scanSettingsFor(image.cols, image.rows, minFace, declared);
+    };
 
-    StageCounts faceCounts;
-    std::vector<float> faceScores;
-    size_t missed = 0;
-    for (const training::FaceImage& face : validation.faces) {
-      float best = -1.0f;
+    const size_t faces = validation.faces.size();
+    const size_t negatives = validation.negatives.size();
+    std::vector<ImageResult> results(faces + negatives);
+    training::forEachItem(results.size(), states.size(), [&](size_t i, size_t worker) {
+      tavilib::DetectorState& state = states[worker];
+      ImageResult& result = results[i];
+      const cv::Mat& image =
+          i < faces ? validation.faces[i].pixels : validation.negatives[i - faces];
       for (const tavilib::Detection& detection :
-           detectCounting(state, face.pixels, minFace, faceCounts)) {
-        if (training::intersectionOverUnion(boxOf(detection), face.box) >= kMatchIoU) {
-          best = std::max(best, detection.score);
+           training::detectCounting(state, image, settingsFor(image), result.counts)) {
+        if (i >= faces) {
+          result.scores.push_back(detection.score);
+        } else if (training::intersectionOverUnion(boxOf(detection), validation.faces[i].box) >=
+                   kMatchIoU) {
+          result.scores = {std::max(result.scores.empty() ? 0.0f : result.scores[0],
+                                    detection.score)};
         }
       }
-      if (best >= 0.0f) {
-        faceScores.push_back(best);
-      } else {
-        ++missed;
+      if (i < faces) {
+        for (size_t s = 1; s < stages; ++s) {
+          result.kept.push_back(
+              hasMatch(windowsAfter(state, s, image, settingsFor(image)), validation.faces[i].box));
+        }
+      }
+    });
+
+    training::StageCounts faceCounts;
+    training::StageCounts negativeCounts;
+    std::vector<float> faceScores;
+    std::vector<float> falseScores;
+    std::vector<size_t> kept(stages, 0);
+    for (size_t i = 0; i < results.size(); ++i) {
+      training::StageCounts& counts = i < faces ? faceCounts : negativeCounts;
+      counts.in.resize(stages, 0.0);
+      counts.out.resize(stages, 0.0);
+      for (size_t s = 0; s < stages; ++s) {
+        counts.in[s] += results[i].counts.in[s];
+        counts.out[s] += results[i].counts.out[s];
+      }
+      counts.nanScores += results[i].counts.nanScores;
+      (i < faces ? faceScores : falseScores)
+          .insert((i < faces ? faceScores : falseScores).end(), results[i].scores.begin(),
+                  results[i].scores.end());
+      for (size_t s = 0; s < results[i].kept.size(); ++s) {
+        kept[s] += results[i].kept[s];
       }
     }
-    StageCounts negativeCounts;
-    std::vector<float> falseScores;
     double megapixels = 0.0;
     int largestMinFace = minFace;
     for (const cv::Mat& image : validation.negatives) {
       megapixels += static_cast<double>(image.total()) / 1e6;
       largestMinFace = std::max(
-          largestMinFace, training::minimumFaceOf(training::scanSettingsFor(image.cols, image.rows,
-                                                                            minFace, declared),
-                                                  image.cols, image.rows));
-      for (const tavilib::Detection& detection :
-           detectCounting(state, image, minFace, negativeCounts)) {
-        falseScores.push_back(detection.score);
-      }
+          largestMinFace, training::minimumFaceOf(settingsFor(image), image.cols, image.rows));
     }
-    const size_t faces = validation.faces.size();
-    const size_t negatives = validation.negatives.size();
+    const size_t missed = faces - faceScores.size();
     std::printf("faces68 val: %zu faces, %zu found, recall %.4f\n", faces, faces - missed,
                 static_cast<double>(faces - missed) / static_cast<double>(faces));
     std::printf("held-out negatives: %zu images (%.2f megapixels; minimum face up to %d px), %zu "
@@ -230,6 +252,10 @@ int main(int argc, char** argv) {
                 negatives, megapixels, largestMinFace, falseScores.size(),
                 static_cast<double>(falseScores.size()) / static_cast<double>(negatives),
                 static_cast<double>(falseScores.size()) / megapixels);
+    for (size_t s = 0; s + 1 < stages; ++s) {
+      std::printf("  faces with a matching window after stage %zu: %.4f\n", s,
+                  static_cast<double>(kept[s]) / static_cast<double>(faces));
+    }
     printCounts("face images", faceCounts, faces);
     printCounts("negative images", negativeCounts, negatives);
     std::printf("NaN scan scores: %ld on face images, %ld on negative images\n",

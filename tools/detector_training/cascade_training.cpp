@@ -60,7 +60,7 @@ std::vector<StageSpec> cascadeStages() {
        {12, 2, {0.2f, 0.15f}, 60, 3, 0, 0, 0.0f}},
       {"cascades/x32Net", tavilib::kStage1NetText, Role::kGrader, 0.8f, 10, grader,
        {24, 2, {0.2f, 0.15f}, 10, 1, 40, 4, 0.5f}},
-      {"cascades/x32Net-x32-3Scales-200", tavilib::kCalibrationNetText, Role::kCalibration, 0.0f, 12,
+      {"cascades/x32Net-x32-3Scales-200", tavilib::kCalibrationNetText, Role::kCalibration, 0.0f, 40,
        calibration, {24, 0, {0.0f, 0.0f}, 0, 0, 0, 0, 0.0f}},
       {"cascades/x64Net", tavilib::kStage2NetText, Role::kGrader, 0.98f, 6, lastGrader,
        {48, 2, {0.1f, 0.1f}, 5, 1, 40, 4, 0.6f}},
@@ -166,18 +166,15 @@ void addToCascade(tavilib::DetectorState& soFar, const StageSpec& stage,
 }
 
 void trainStage(const StageSpec& stage, unsigned stageSeed, const DetectorData& train,
-                const DetectorData& validation, tavilib::DetectorState& soFar,
+                const DetectorData& validation, std::vector<tavilib::DetectorState>& soFar,
                 const std::string& folder, const std::string& snapshots, int shrink,
                 int threads) {
   const auto start = std::chrono::steady_clock::now();
   openblas_set_num_threads(1);
-  WindowSampler fixedSampler(stage.recipe.side, stageSeed);
-  const WindowSet fixed =
-      drawFixedWindows(train, stage.recipe, soFar, kMiningMinFace, kScanInput, fixedSampler);
-  WindowSampler validationSampler(stage.recipe.side, stageSeed + 1);
+  const FixedWindowScan scan{kMiningMinFace, kMiningMinFaceInFaceImages, kScanInput};
+  const WindowSet fixed = drawFixedWindows(train, stage.recipe, soFar, scan, stageSeed);
   WindowSet validationSet = windowsOfEpoch(validation, stage, stageSeed + 2);
-  validationSet.append(drawFixedWindows(validation, stage.recipe, soFar, kMiningMinFace,
-                                        kScanInput, validationSampler));
+  validationSet.append(drawFixedWindows(validation, stage.recipe, soFar, scan, stageSeed + 1));
   WindowSet first = windowsOfEpoch(train, stage, stageSeed + 100);
   first.append(fixed);
   std::printf("  windows: %zu fixed (%zu faces among them), %zu drawn per epoch, %zu to validate "
@@ -256,7 +253,8 @@ void trainCascade(const CascadeTrainingOptions& options) {
               validation.faces.size(), validation.negatives.size(), secondsSince(start));
 
   const std::vector<StageSpec> stages = cascadeStages();
-  tavilib::DetectorState soFar;
+  // The cascade so far, once for each worker of the mining.
+  std::vector<tavilib::DetectorState> soFar(static_cast<size_t>(options.threads));
   for (size_t s = 0; s < stages.size(); ++s) {
     const StageSpec& stage = stages[s];
     const std::string folder = options.workFolder + "/model/" + stage.folder;
@@ -269,7 +267,9 @@ void trainCascade(const CascadeTrainingOptions& options) {
                  folder, options.workFolder + "/snapshots/" + fs::path(stage.folder).filename().string(),
                  options.shrink, options.threads);
     }
-    addToCascade(soFar, stage, folder);
+    for (tavilib::DetectorState& copy : soFar) {
+      addToCascade(copy, stage, folder);
+    }
   }
 
   for (const StageSpec& stage : stages) {

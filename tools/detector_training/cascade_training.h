@@ -15,8 +15,8 @@ struct CascadeTrainingOptions {
   unsigned seed = 1;
   // Uses every shrink-th image and 1/shrink of the epochs, for a trial run.
   int shrink = 1;
-  // Threads of the matrix library while a net trains; mining and validation,
-  // one window at a time, run on one.
+  // Threads of the matrix library while a net trains, and of the mining,
+  // where each thread runs its own copy of the cascade.
   int threads = 2;
 };
 

@@ -4,6 +4,7 @@
 
 #include "detector_training/cascade_recorder.h"
 #include "detector_training/face_box.h"
+#include "detector_training/parallel_items.h"
 #include "detector_training/scan_settings.h"
 
 namespace training {
@@ -80,47 +81,77 @@ WindowSet drawCalibrationWindows(const DetectorData& data, int perFace,
   return set;
 }
 
-WindowSet drawFixedWindows(const DetectorData& data, const StageRecipe& recipe,
-                           tavilib::DetectorState& soFar, int minFace, int maxBase,
-                           WindowSampler& sampler) {
+namespace {
+
+WindowSet negativeImageWindows(const cv::Mat& image, const StageRecipe& recipe,
+                               tavilib::DetectorState& cascade, bool mining,
+                               const FixedWindowScan& scan, WindowSampler& sampler) {
   WindowSet set;
-  const bool mining = !soFar.stages.empty() &&
-                      (recipe.minedPerNegativeImage > 0 || recipe.minedPerFaceImage > 0);
-  for (const cv::Mat& image : data.negatives) {
-    for (int k = 0; k < recipe.randomNegativesPerImage; ++k) {
-      addIfCut(set, sampler.negative(image, kSmallestFace), 0);
-    }
-    if (mining) {
-      const auto settings = scanSettingsFor(image.cols, image.rows, minFace, maxBase);
-      addMined(set, image,
-               pick(windowsForNextStage(soFar, image, settings), recipe.minedPerNegativeImage,
-                    sampler.random()),
-               0, sampler);
+  for (int k = 0; k < recipe.randomNegativesPerImage; ++k) {
+    addIfCut(set, sampler.negative(image, kSmallestFace), 0);
+  }
+  if (mining) {
+    const auto settings = scanSettingsFor(image.cols, image.rows, scan.minFace, scan.maxBase);
+    addMined(set, image,
+             pick(windowsForNextStage(cascade, image, settings), recipe.minedPerNegativeImage,
+                  sampler.random()),
+             0, sampler);
+  }
+  return set;
+}
+
+WindowSet faceImageWindows(const FaceImage& face, const StageRecipe& recipe,
+                           tavilib::DetectorState& cascade, bool mining,
+                           const FixedWindowScan& scan, WindowSampler& sampler) {
+  WindowSet set;
+  for (int k = 0; k < recipe.partFacesPerImage; ++k) {
+    addIfCut(set, sampler.partFace(face.pixels, face.box), 0);
+  }
+  if (!mining) {
+    return set;
+  }
+  std::vector<tavilib::Window> positives;
+  std::vector<tavilib::Window> negatives;
+  const auto settings =
+      scanSettingsFor(face.pixels.cols, face.pixels.rows, scan.minFaceInFaceImages, scan.maxBase);
+  for (const tavilib::Window& window : windowsForNextStage(cascade, face.pixels, settings)) {
+    const cv::Rect2f rect = toRect(window);
+    const float overlap = intersectionOverUnion(rect, face.box);
+    if (overlap >= recipe.minPositiveIoU) {
+      positives.push_back(window);
+    } else if (overlap < kNegativeIoU && (rect & face.box).area() > 0.0f) {
+      negatives.push_back(window);
     }
   }
-  for (const FaceImage& face : data.faces) {
-    for (int k = 0; k < recipe.partFacesPerImage; ++k) {
-      addIfCut(set, sampler.partFace(face.pixels, face.box), 0);
-    }
-    if (!mining) {
-      continue;
-    }
-    std::vector<tavilib::Window> positives;
-    std::vector<tavilib::Window> negatives;
-    const auto settings = scanSettingsFor(face.pixels.cols, face.pixels.rows, minFace, maxBase);
-    for (const tavilib::Window& window : windowsForNextStage(soFar, face.pixels, settings)) {
-      const cv::Rect2f rect = toRect(window);
-      const float overlap = intersectionOverUnion(rect, face.box);
-      if (overlap >= recipe.minPositiveIoU) {
-        positives.push_back(window);
-      } else if (overlap < kNegativeIoU && (rect & face.box).area() > 0.0f) {
-        negatives.push_back(window);
-      }
-    }
-    addMined(set, face.pixels, pick(positives, recipe.minedPerFaceImage, sampler.random()), 1,
-             sampler);
-    addMined(set, face.pixels, pick(negatives, recipe.minedPerFaceImage, sampler.random()), 0,
-             sampler);
+  addMined(set, face.pixels, pick(positives, recipe.minedPerFaceImage, sampler.random()), 1,
+           sampler);
+  addMined(set, face.pixels, pick(negatives, recipe.minedPerFaceImage, sampler.random()), 0,
+           sampler);
+  return set;
+}
+
+}  // namespace
+
+WindowSet drawFixedWindows(const DetectorData& data, const StageRecipe& recipe,
+                           std::vector<tavilib::DetectorState>& cascades,
+                           const FixedWindowScan& scan, unsigned seed) {
+  const bool mining = !cascades[0].stages.empty() &&
+                      (recipe.minedPerNegativeImage > 0 || recipe.minedPerFaceImage > 0);
+  const size_t images = data.negatives.size() + data.faces.size();
+  std::vector<WindowSet> perImage(images);
+  // Each image has a generator of its own, so that the windows do not depend
+  // on which worker took the image.
+  forEachItem(images, cascades.size(), [&](size_t i, size_t worker) {
+    WindowSampler sampler(recipe.side, seed * 1000003u + static_cast<unsigned>(i));
+    perImage[i] = i < data.negatives.size()
+                      ? negativeImageWindows(data.negatives[i], recipe, cascades[worker], mining,
+                                             scan, sampler)
+                      : faceImageWindows(data.faces[i - data.negatives.size()], recipe,
+                                         cascades[worker], mining, scan, sampler);
+  });
+  WindowSet set;
+  for (const WindowSet& part : perImage) {
+    set.append(part);
   }
   return set;
 }

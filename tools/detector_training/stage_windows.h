@@ -39,13 +39,23 @@ WindowSet drawCalibrationWindows(const DetectorData& data, int perFace,
                                  const std::vector<tavilib::OffsetScale>& table,
                                  WindowSampler& sampler);
 
+// How the cascade so far scans images while mining: for faces of minFace
+// pixels and up in non-face images and of minFaceInFaceImages and up in face
+// images, with the scan net's declared input maxBase.
+struct FixedWindowScan {
+  int minFace;
+  int minFaceInFaceImages;
+  int maxBase;
+};
+
 // The fixed windows of a stage: random and part-face negatives, and the
-// windows that the cascade so far (soFar, empty for the first stage) hands
-// on from negative and face images, scanned for faces of minFace pixels
-// and up with the scan net's declared input maxBase.
+// windows that the cascade so far hands on from non-face and face images.
+// cascades holds one copy of the cascade so far (no stages for the first
+// stage) for each worker thread, since a net serves one thread at a time.
+// The result depends on the seed, not on the number of workers.
 WindowSet drawFixedWindows(const DetectorData& data, const StageRecipe& recipe,
-                           tavilib::DetectorState& soFar, int minFace, int maxBase,
-                           WindowSampler& sampler);
+                           std::vector<tavilib::DetectorState>& cascades,
+                           const FixedWindowScan& scan, unsigned seed);
 
 }  // namespace training
 

@@ -1,0 +1,107 @@
+#include <gtest/gtest.h>
+
+#include <opencv2/imgcodecs.hpp>
+#include <unistd.h>
+
+#include <filesystem>
+#include <fstream>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "tavilib.h"
+#include "temp_dir.h"
+
+namespace tavilib {
+namespace {
+
+namespace fs = std::filesystem;
+
+const char kModelRoot[] = TAVI_SOURCE_DIR "/Tavi/public/";
+const char kValidationCsv[] = TAVI_SOURCE_DIR "/../shared/data/faces68/val.csv";
+
+// The first few held-out frames with their 68 points.
+struct Frame {
+  cv::Mat pixels;
+  std::vector<float> points;
+};
+
+std::vector<Frame> ValidationFrames(int count) {
+  std::vector<Frame> frames;
+  std::ifstream csv(kValidationCsv);
+  std::string line;
+  std::getline(csv, line);
+  while (static_cast<int>(frames.size()) < count && std::getline(csv, line)) {
+    std::stringstream fields(line);
+    std::string file;
+    std::string person;
+    std::getline(fields, file, ',');
+    std::getline(fields, person, ',');
+    Frame frame{cv::imread(fs::path(kValidationCsv).parent_path() / file), {}};
+    for (std::string value; std::getline(fields, value, ',');) {
+      frame.points.push_back(std::stof(value));
+    }
+    frames.push_back(std::move(frame));
+  }
+  return frames;
+}
+
+std::vector<Detection> Detect(Detector& detector, const cv::Mat& image) {
+  // A minimum face of 30 pixels keeps the base image within the built-in scan
+  // net's 384 pixels.
+  const int longEdge = std::max(image.cols, image.rows);
+  const CascadeParameter scan{1.0f, longEdge, 30.5f / static_cast<float>(longEdge), 30, 1.2f, 12};
+  std::vector<Detection> detections;
+  Image wrapped{image.cols, image.rows, static_cast<int32_t>(image.step), image.data};
+  EXPECT_EQ(detect(wrapped, detector, detections, scan), STATUS_OK);
+  return detections;
+}
+
+// The built-in load finds its weights at "../../../Tavi/public/cascades/...":
+// run it from three folders below a folder that links to the project's.
+Status LoadBuiltIn(Detector& detector) {
+  TempDir dir;
+  fs::create_directory_symlink(TAVI_SOURCE_DIR "/Tavi", dir.path() + "/Tavi");
+  fs::create_directories(dir.path() + "/a/b/c");
+  const fs::path before = fs::current_path();
+  fs::current_path(dir.path() + "/a/b/c");
+  const Status status = detector.load();
+  fs::current_path(before);
+  return status;
+}
+
+TEST(ShippedCascadeTest, FolderAndBuiltInLoadsFindTheSameFaces) {
+  const std::vector<Frame> frames = ValidationFrames(4);
+  if (frames.empty()) {
+    GTEST_SKIP() << "no validation data at " << kValidationCsv;
+  }
+  Detector fromFolder;
+  ASSERT_EQ(fromFolder.load(DetectorParams(kModelRoot, "cascade.list")), STATUS_OK);
+  Detector builtIn;
+  ASSERT_EQ(LoadBuiltIn(builtIn), STATUS_OK);
+  for (const Frame& frame : frames) {
+    ASSERT_FALSE(frame.pixels.empty());
+    const std::vector<Detection> folderFaces = Detect(fromFolder, frame.pixels);
+    const std::vector<Detection> builtInFaces = Detect(builtIn, frame.pixels);
+    ASSERT_EQ(folderFaces.size(), builtInFaces.size());
+    for (size_t i = 0; i < folderFaces.size(); ++i) {
+      EXPECT_EQ(folderFaces[i].box.left, builtInFaces[i].box.left);
+      EXPECT_EQ(folderFaces[i].box.top, builtInFaces[i].box.top);
+      EXPECT_EQ(folderFaces[i].box.right, builtInFaces[i].box.right);
+      EXPECT_EQ(folderFaces[i].box.bottom, builtInFaces[i].box.bottom);
+      EXPECT_EQ(folderFaces[i].score, builtInFaces[i].score);
+    }
+    // The best face holds both outer eye corners and the chin.
+    ASSERT_FALSE(folderFaces.empty());
+    const Rectangle<float>& box = folderFaces[0].box;
+    for (int point : {36, 45, 8}) {
+      const float x = frame.points[2 * point];
+      const float y = frame.points[2 * point + 1];
+      EXPECT_TRUE(x > box.left && x < box.right && y > box.top && y < box.bottom + 0.1f * (box.bottom - box.top))
+          << "point " << point;
+    }
+  }
+}
+
+}  // namespace
+}  // namespace tavilib

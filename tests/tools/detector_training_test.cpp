@@ -1,0 +1,230 @@
+#include <gtest/gtest.h>
+
+#include <opencv2/core.hpp>
+
+#include <cmath>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "detector/cascade_net_texts.h"
+#include "detector/default_cascade_tables.h"
+#include "detector/image_planes.h"
+#include "detector/pyramid_geometry.h"
+#include "detector/window_grading.h"
+#include "detector_training/face_box.h"
+#include "detector_training/net_trainer.h"
+#include "detector_training/scan_settings.h"
+#include "detector_training/training_data.h"
+#include "detector_training/window_sampler.h"
+#include "nn/net.h"
+#include "nn/util/io.h"
+#include "temp_dir.h"
+
+namespace training {
+namespace {
+
+TEST(FaceBoxTest, SquareFromBrowTopToLowestPointCentredOnThePoints) {
+  // A face 80 wide, brows at 20 and chin at 140: the box is 120 on a side,
+  // centred on x 50 and y 80.
+  std::vector<cv::Point2f> points(68, cv::Point2f(50.0f, 60.0f));
+  points[0] = {10.0f, 70.0f};
+  points[16] = {90.0f, 70.0f};
+  points[8] = {50.0f, 140.0f};
+  points[19] = {30.0f, 20.0f};
+  points[30] = {50.0f, 5.0f};  // above the brows, but no brow: ignored for the top
+  const cv::Rect2f box = faceBoxFromPoints(points);
+  EXPECT_FLOAT_EQ(box.width, 120.0f);
+  EXPECT_FLOAT_EQ(box.height, 120.0f);
+  EXPECT_FLOAT_EQ(box.x, -10.0f);
+  EXPECT_FLOAT_EQ(box.y, 20.0f);
+  EXPECT_FLOAT_EQ(intersectionOverUnion(box, box), 1.0f);
+  EXPECT_FLOAT_EQ(intersectionOverUnion(box, cv::Rect2f(-10, 20, 60, 120)), 0.5f);
+}
+
+// A calibration net that always answers class `answer`.
+tavilib::CascadeStage FixedCalibration(int answer) {
+  const std::string text = R"(
+    input: "data" input_dim: 1 input_dim: 3 input_dim: 24 input_dim: 24
+    layers { name: "fcf" type: INNER_PRODUCT bottom: "data" top: "fcf"
+             inner_product_param { num_output: 19 } }
+    layers { name: "probs" type: SOFTMAX bottom: "fcf" top: "probs" })";
+  tavilib::CascadeStage stage;
+  stage.net.reset(new nn::Net<float>(text, nn::NetDescription::kText));
+  float* bias = stage.net->layers()[0]->blobs()[1]->mutable_cpu_data();
+  std::fill_n(bias, 19, 0.0f);
+  bias[answer] = 50.0f;
+  const tavilib::DefaultCascadeTables tables;
+  for (size_t i = 0; i < tables.offsetsX.size(); ++i) {
+    stage.offsetsScales.push_back(
+        {tables.offsetsX[i], tables.offsetsY[i], static_cast<float>(tables.scales[i])});
+  }
+  return stage;
+}
+
+TEST(CalibrationSquareTest, TheDetectorsCorrectionOfEachClassBringsItsSquareBackToTheFace) {
+  const cv::Mat image(400, 400, CV_8UC3, cv::Scalar(0, 0, 0));
+  const cv::Rect2f face(150.0f, 140.0f, 96.0f, 96.0f);
+  for (int k = 0; k < 19; ++k) {
+    tavilib::CascadeStage calibration = FixedCalibration(k);
+    const cv::Rect2f square = calibrationSquare(face, calibration.offsetsScales[k], 24);
+    const tavilib::Window window{static_cast<int>(std::lround(square.x)),
+                                 static_cast<int>(std::lround(square.y)),
+                                 static_cast<int>(std::lround(square.width)),
+                                 static_cast<int>(std::lround(square.height)), 0.9f, 0};
+    const tavilib::Window back = tavilib::calibrateWindows({window}, calibration, image)[0];
+    EXPECT_NEAR(back.x, face.x, 1.5) << "class " << k;
+    EXPECT_NEAR(back.y, face.y, 1.5) << "class " << k;
+    EXPECT_NEAR(back.width, face.width, 1.5) << "class " << k;
+    if (k != 0) {
+      EXPECT_NE(window.x + 100 * window.y + 10000 * window.width,
+                back.x + 100 * back.y + 10000 * back.width)
+          << "class " << k << " moves its window";
+    }
+  }
+}
+
+TEST(ScanSettingsTest, GiveExactlyTheMinimumFaceAndABaseInsideTheScanInput) {
+  std::mt19937 random(3);
+  for (int trial = 0; trial < 3000; ++trial) {
+    const int columns = 20 + static_cast<int>(random() % 3000);
+    const int rows = 20 + static_cast<int>(random() % 3000);
+    const int minFace = 12 + static_cast<int>(random() % 150);
+    const tavilib::CascadeParameter settings = scanSettingsFor(columns, rows, minFace, 640);
+    const tavilib::PyramidGeometry geometry =
+        tavilib::computePyramidGeometry(columns, rows, settings);
+    ASSERT_LE(geometry.baseWidth, 640) << columns << "x" << rows << " " << minFace;
+    ASSERT_LE(geometry.baseHeight, 640) << columns << "x" << rows << " " << minFace;
+    const int honoured = minimumFaceOf(settings, columns, rows);
+    ASSERT_GE(honoured, minFace);
+    if (honoured > minFace) {
+      // Only as much larger as the scan input demands.
+      const tavilib::PyramidGeometry smaller = tavilib::computePyramidGeometry(
+          columns, rows, scanSettingsFor(columns, rows, honoured - 1, 100000));
+      ASSERT_GT(std::max(smaller.baseWidth, smaller.baseHeight), 640);
+    }
+  }
+}
+
+TEST(TrainingDataTest, RefusesMissingFoldersAndBadLinesNamingFileAndLine) {
+  TempDir dir;
+  try {
+    loadTrainingData(dir.path() + "/");
+    FAIL() << "an empty folder was accepted";
+  } catch (const DataError& error) {
+    EXPECT_EQ(std::string(error.what()), "cannot open " + dir.path() + "/faces68/train.csv");
+  }
+  std::string header = "file,person";
+  std::string line = "images/a.jpg,a";
+  for (int p = 0; p < 68; ++p) {
+    header += ",x" + std::to_string(p) + ",y" + std::to_string(p);
+    line += ",1,2";
+  }
+  const std::string good = header + "\n" + line + "\n";
+  EXPECT_EQ(readLabelledFaces(dir.write("good.csv", good)).at(0).points.at(67), cv::Point2f(1, 2));
+  const std::string csv = dir.write("bad.csv", good + line.substr(0, line.size() - 1) + "x\n");
+  EXPECT_THROW(
+      try { readLabelledFaces(csv); } catch (const DataError& error) {
+        EXPECT_EQ(std::string(error.what()), csv + ":3: 'x' is not a number");
+        throw;
+      },
+      DataError);
+  const std::string shortLine = dir.write("short.csv", header + "\nimages/a.jpg,a,1\n");
+  EXPECT_THROW(
+      try { readLabelledFaces(shortLine); } catch (const DataError& error) {
+        EXPECT_EQ(std::string(error.what()), shortLine + ":2: 3 fields, the header has 138");
+        throw;
+      },
+      DataError);
+  EXPECT_THROW(readImage(dir.write("broken.jpg", "not an image")), DataError);
+}
+
+TEST(NetTrainerTest, TrainingFormOfTheCascadeNets) {
+  const nn::NetParameter scan = trainingDescription(tavilib::kStage0NetText, 16, 12, true);
+  EXPECT_NE(scan.layers(scan.layers_size() - 1).type(), nn::LayerParameter::SOFTMAX);
+  EXPECT_EQ(scan.input_dim(0), 16);
+  EXPECT_EQ(scan.input_dim(2), 12);
+  // The scan's first convolution: input-scaled rate, no bias learnt.
+  EXPECT_FLOAT_EQ(scan.layers(0).blobs_lr(0), 1.0f / 4096.0f);
+  EXPECT_FLOAT_EQ(scan.layers(0).blobs_lr(1), 0.0f);
+  EXPECT_FLOAT_EQ(scan.layers(0).weight_decay(0), 4096.0f);
+  // In the 48-pixel grader every convolution of a pooled copy of the input
+  // is input-scaled too; the one behind a normalisation is not.
+  const nn::NetParameter grader = trainingDescription(tavilib::kStage2NetText, 4, 48, false);
+  for (const nn::LayerParameter& layer : grader.layers()) {
+    if (layer.type() == nn::LayerParameter::CONVOLUTION) {
+      const bool inputFed = layer.name() != "x64-conv2";
+      EXPECT_FLOAT_EQ(layer.blobs_lr(0), inputFed ? 1.0f / 4096.0f : 1.0f) << layer.name();
+      EXPECT_FLOAT_EQ(layer.blobs_lr(1), 1.0f) << layer.name();
+    }
+  }
+}
+
+// Bright squares in the middle against noise: a problem the scan net must
+// learn in a few epochs.
+WindowSet SquaresAndNoise(unsigned seed) {
+  std::mt19937 random(seed);
+  WindowSet set;
+  for (int i = 0; i < 512; ++i) {
+    cv::Mat window(12, 12, CV_8UC3);
+    cv::randu(window, cv::Scalar::all(0), cv::Scalar::all(120));
+    const int label = i % 2;
+    if (label == 1) {
+      const int x = 3 + static_cast<int>(random() % 3);
+      window(cv::Rect(x, 3, 5, 6)).setTo(cv::Scalar::all(200 + static_cast<int>(random() % 50)));
+    }
+    set.add(window, label);
+  }
+  return set;
+}
+
+TEST(NetTrainerTest, LearnsAndExportsAScanNetWhoseStoredResponseVanishes) {
+  NetTrainingSettings settings;
+  settings.batch = 32;
+  settings.baseLr = 0.02f;
+  NetTrainer trainer(tavilib::kStage0NetText, 12, true, settings, std::vector<float>(432, 100.0f));
+  const WindowSet train = SquaresAndNoise(1);
+  for (int epoch = 0; epoch < 6; ++epoch) {
+    trainer.trainEpoch(train, epoch);
+  }
+  const WindowSet test = SquaresAndNoise(2);
+  const std::vector<std::vector<float>> probabilities = trainer.probabilities(test);
+  ASSERT_EQ(probabilities.size(), test.size());
+  int right = 0;
+  for (size_t i = 0; i < test.size(); ++i) {
+    right += (probabilities[i][1] > 0.5f) == (test.labels[i] == 1);
+  }
+  EXPECT_GT(right, 500);
+
+  // Deployed at 60 by 60 and primed, the net at a smaller pyramid size gives
+  // the map of a plain net declared at that size: the flat correction added
+  // to the first convolution is zero.
+  nn::NetParameter primedText;
+  nn::ReadNetParamsFromText(tavilib::kStage0NetText, &primedText);
+  nn::NetParameter plainText = primedText;
+  primedText.set_input_dim(2, 60);
+  primedText.set_input_dim(3, 60);
+  plainText.set_input_dim(2, 41);
+  plainText.set_input_dim(3, 30);
+  nn::Net<float> primed(primedText);
+  nn::Net<float> plain(plainText);
+  primed.CopyTrainedLayersFrom(trainer.deployWeights());
+  plain.CopyTrainedLayersFrom(trainer.deployWeights());
+  primed.FirstRun();
+  primed.AlterInputShape(30, 41);
+  cv::Mat level(41, 30, CV_8UC3);
+  cv::randu(level, cv::Scalar::all(0), cv::Scalar::all(256));
+  std::vector<float> planes(3 * 41 * 30);
+  tavilib::writeImagePlanes(level, planes.data(), static_cast<int>(planes.size()));
+  std::copy(planes.begin(), planes.end(), primed.net_input_blobs()[0]->mutable_cpu_data());
+  std::copy(planes.begin(), planes.end(), plain.net_input_blobs()[0]->mutable_cpu_data());
+  const nn::Blob<float>& fromPrimed = *primed.FF()[0];
+  const nn::Blob<float>& fromPlain = *plain.Forward()[0];
+  ASSERT_EQ(fromPrimed.count(), fromPlain.count());
+  for (int i = 0; i < fromPlain.count(); ++i) {
+    EXPECT_NEAR(fromPrimed.cpu_data()[i], fromPlain.cpu_data()[i], 1e-5f) << i;
+  }
+}
+
+}  // namespace
+}  // namespace training
