@@ -23,6 +23,7 @@
 #include <vector>
 
 #include "detector/cascade_loader.h"
+#include "command_line.h"
 #include "detector_training/cascade_recorder.h"
 #include "detector_training/counted_detection.h"
 #include "detector_training/face_box.h"
@@ -159,13 +160,9 @@ int main(int argc, char** argv) {
       "write the recall curve to this PNG")(
       "threads", po::value<int>(&threads)->default_value(2), "images measured at once");
   try {
-    po::variables_map values;
-    po::store(po::parse_command_line(argc, argv, described), values);
-    if (values.count("help") > 0) {
-      std::cout << described << "\n";
+    if (!tools::parseCommandLine(argc, argv, described)) {
       return 0;
     }
-    po::notify(values);
 
     // The nets run one window at a time, where the matrix library's own
     // threads cost more than they give; the workers share out the images.

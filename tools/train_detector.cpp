@@ -14,6 +14,7 @@
 #include <exception>
 #include <iostream>
 
+#include "command_line.h"
 #include "detector_training/cascade_training.h"
 
 namespace po = boost::program_options;
@@ -46,13 +47,9 @@ int main(int argc, char** argv) {
       "threads", po::value<int>(&options.threads)->default_value(2),
       "threads of the matrix library while a net trains");
   try {
-    po::variables_map values;
-    po::store(po::parse_command_line(argc, argv, described), values);
-    if (values.count("help") > 0) {
-      std::cout << described << "\n";
+    if (!tools::parseCommandLine(argc, argv, described)) {
       return 0;
     }
-    po::notify(values);
     options.dataRoot = asFolder(options.dataRoot);
     options.outputRoot = asFolder(options.outputRoot);
     if (options.shrink < 1 || options.threads < 1) {

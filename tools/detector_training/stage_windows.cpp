@@ -1,5 +1,7 @@
 #include "detector_training/stage_windows.h"
 
+#include <opencv2/imgproc.hpp>
+
 #include <algorithm>
 
 #include "detector_training/cascade_recorder.h"
@@ -15,6 +17,8 @@ constexpr float kNegativeIoU = 0.3f;
 // Random negatives are at least this large in the image, the smallest face
 // the detector is asked for.
 constexpr int kSmallestFace = 20;
+// The square root of the scan's scale step.
+constexpr double kHalfScaleStep = 0.9128709;
 
 cv::Rect2f toRect(const tavilib::Window& window) {
   return cv::Rect2f(static_cast<float>(window.x), static_cast<float>(window.y),
@@ -90,10 +94,22 @@ WindowSet negativeImageWindows(const cv::Mat& image, const StageRecipe& recipe,
   for (int k = 0; k < recipe.randomNegativesPerImage; ++k) {
     addIfCut(set, sampler.negative(image, kSmallestFace), 0);
   }
-  if (mining) {
-    const auto settings = scanSettingsFor(image.cols, image.rows, scan.minFace, scan.maxBase);
-    addMined(set, image,
-             pick(windowsForNextStage(cascade, image, settings), recipe.minedPerNegativeImage,
+  if (!mining) {
+    return set;
+  }
+  // The mirrored image and one scaled by half a pyramid step meet the scan's
+  // grid at other places, and give other hard windows.
+  for (int variant = 0; variant < recipe.miningVariants; ++variant) {
+    cv::Mat seen = image;
+    if (variant % 2 == 1) {
+      cv::flip(image, seen, 1);
+    }
+    if (variant >= 2) {
+      cv::resize(seen, seen, cv::Size(), kHalfScaleStep, kHalfScaleStep, cv::INTER_AREA);
+    }
+    const auto settings = scanSettingsFor(seen.cols, seen.rows, scan.minFace, scan.maxBase);
+    addMined(set, seen,
+             pick(windowsForNextStage(cascade, seen, settings), recipe.minedPerNegativeImage,
                   sampler.random()),
              0, sampler);
   }

@@ -27,6 +27,9 @@ struct StageRecipe {
   int minedPerNegativeImage;
   int minedPerFaceImage;
   float minPositiveIoU;
+  // Non-face images are mined as they are (1), also mirrored (2), and both
+  // again scaled by half a pyramid step (4).
+  int miningVariants = 1;
 };
 
 // Positives for one epoch: faces and crops moved within the recipe's jitter,

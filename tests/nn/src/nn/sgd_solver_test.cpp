@@ -1,6 +1,5 @@
 #include "nn/sgd_solver.h"
 
-#include <google/protobuf/text_format.h>
 #include <gtest/gtest.h>
 
 #include <cmath>
@@ -13,12 +12,6 @@
 
 namespace nn {
 namespace {
-
-NetParameter Parse(const std::string& text) {
-  NetParameter param;
-  EXPECT_TRUE(google::protobuf::TextFormat::ParseFromString(text, &param)) << text;
-  return param;
-}
 
 // Every layer type of the cascade nets: two branches on the input (one
 // through an average pool, so the input gets a split), convolution, max
@@ -61,7 +54,7 @@ double WeightedOutput(Net<float>& net, const std::vector<float>& weights) {
 }
 
 TEST(NetBackwardTest, MatchesFiniteDifferencesThroughEveryCascadeLayerType) {
-  Net<float> net(Parse(kCascadeLikeNet));
+  Net<float> net(kCascadeLikeNet, NetDescription::kText);
   FillUniform(net.net_input_blobs()[0], -1.0f, 1.0f);
   const std::vector<float> weights = {0.7f, -1.3f, 0.4f};
   WeightedOutput(net, weights);
@@ -133,7 +126,7 @@ double RegressionStep(Net<float>& net, SGDSolver<float>& solver) {
 }
 
 TEST(SGDSolverTest, LearnsARegressionAndFollowsTheRateSchedule) {
-  Net<float> net(Parse(kRegressionNet));
+  Net<float> net(kRegressionNet, NetDescription::kText);
   SGDSolver<float> solver(Settings(), &net);
   EXPECT_FLOAT_EQ(solver.LearningRate(), 0.05f);
   const double first = RegressionStep(net, solver);
@@ -151,7 +144,7 @@ TEST(SGDSolverTest, LearnsARegressionAndFollowsTheRateSchedule) {
 }
 
 TEST(SGDSolverTest, ResumingFromASnapshotGivesTheUninterruptedWeights) {
-  Net<float> straight(Parse(kRegressionNet));
+  Net<float> straight(kRegressionNet, NetDescription::kText);
   SGDSolver<float> straightSolver(Settings(), &straight);
   for (int i = 0; i < 40; ++i) {
     RegressionStep(straight, straightSolver);
@@ -159,14 +152,14 @@ TEST(SGDSolverTest, ResumingFromASnapshotGivesTheUninterruptedWeights) {
 
   TempDir dir;
   {
-    Net<float> first(Parse(kRegressionNet));
+    Net<float> first(kRegressionNet, NetDescription::kText);
     SGDSolver<float> solver(Settings(), &first);
     for (int i = 0; i < 25; ++i) {
       RegressionStep(first, solver);
     }
     solver.Snapshot(dir.path() + "/w", dir.path() + "/s");
   }
-  Net<float> resumed(Parse(kRegressionNet));
+  Net<float> resumed(kRegressionNet, NetDescription::kText);
   SGDSolver<float> solver(Settings(), &resumed);
   solver.Restore(dir.path() + "/s");
   EXPECT_EQ(solver.iter(), 25);
