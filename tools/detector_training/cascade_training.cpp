@@ -47,14 +47,15 @@ std::vector<StageSpec> cascadeStages() {
   NetTrainingSettings scan;
   scan.batch = 128;
   scan.baseLr = 0.02f;
-  scan.positiveWeight = 3.0f;
+  scan.positiveWeight = 5.0f;
   NetTrainingSettings grader;
   grader.baseLr = 0.01f;
-  grader.positiveWeight = 2.0f;
+  grader.positiveWeight = 3.0f;
   NetTrainingSettings calibration;
   calibration.baseLr = 0.01f;
   NetTrainingSettings lastGrader = grader;
   lastGrader.baseLr = 0.005f;
+  lastGrader.positiveWeight = 4.0f;
   return {
       {"cascades/x16Net-demo", tavilib::kStage0NetText, Role::kScan, 0.4f, 15, scan,
        {12, 2, {0.2f, 0.15f}, 60, 3, 0, 0, 0.0f}},
@@ -62,8 +63,8 @@ std::vector<StageSpec> cascadeStages() {
        {24, 2, {0.2f, 0.15f}, 10, 1, 40, 4, 0.5f}},
       {"cascades/x32Net-x32-3Scales-200", tavilib::kCalibrationNetText, Role::kCalibration, 0.0f, 40,
        calibration, {24, 0, {0.0f, 0.0f}, 0, 0, 0, 0, 0.0f}},
-      {"cascades/x64Net", tavilib::kStage2NetText, Role::kGrader, 0.98f, 6, lastGrader,
-       {48, 2, {0.1f, 0.1f}, 5, 1, 40, 4, 0.6f}},
+      {"cascades/x64Net", tavilib::kStage2NetText, Role::kGrader, 0.98f, 7, lastGrader,
+       {48, 2, {0.1f, 0.1f}, 5, 1, 40, 4, 0.55f, 4}},
   };
 }
 
