@@ -139,28 +139,41 @@ std::vector<float> coordinateMedian(const std::vector<std::vector<float>>& shape
   return result;
 }
 
-std::vector<float> regressShapes(const SDMModel& model, const cv::Mat& image,
-                                 const std::vector<std::vector<float>>& starts) {
-  cv::Mat padded;
-  const int pad = padForShape(image, starts.at(0), padded);
-  if (!padded.isContinuous()) padded = padded.clone();
-  const float padding = static_cast<float>(pad);
+FaceFeatures::FaceFeatures(const cv::Mat& image, const std::vector<float>& start,
+                           int32_t scalesPerOctave, int32_t highestLevel)
+    : pad_(padForShape(image, start, padded_)),
+      pyramid_(static_cast<uint64_t>(padded_.cols), static_cast<uint64_t>(padded_.rows),
+               static_cast<uint64_t>(scalesPerOctave)) {
+  if (!padded_.isContinuous()) padded_ = padded_.clone();
+  pyramid_.buildBase(static_cast<uint64_t>(padded_.cols), static_cast<uint64_t>(padded_.rows),
+                     padded_.ptr<uint8_t>(0));
+  pyramid_.buildLevels(static_cast<uint64_t>(
+      std::min<int64_t>(highestLevel, static_cast<int64_t>(scalesPerOctave) + 2)));
+}
 
-  const uint64_t S = static_cast<uint64_t>(model.scalesPerOctave);
-  SiftPyramid pyramid(static_cast<uint64_t>(padded.cols), static_cast<uint64_t>(padded.rows), S);
-  pyramid.buildBase(static_cast<uint64_t>(padded.cols), static_cast<uint64_t>(padded.rows),
-                    padded.ptr<uint8_t>(0));
+void FaceFeatures::compute(const std::vector<float>& paddedShape, int32_t level, float* feature) {
+  for (size_t j = 0; j < paddedShape.size() / 2; ++j) {
+    float norm = 0.0f;
+    pyramid_.computeDescriptor(paddedShape[2 * j], paddedShape[2 * j + 1],
+                               static_cast<float>(level), norm, descriptor_);
+    float* row = feature + j * 128;
+    for (int t = 0; t < 128; ++t) row[t] = static_cast<float>(descriptor_[t]) * 0.00390625f;
+  }
+}
+
+int32_t highestStageLevel(const SDMModel& model) {
   // Only the levels some stage asks for are blurred; the others would not be
   // read.
   int32_t highest = 0;
   for (size_t i = 0; i < model.stageMaps.size(); ++i) highest = std::max(highest, stageLevel(model, i));
-  pyramid.buildLevels(static_cast<uint64_t>(std::min<int64_t>(highest, static_cast<int64_t>(S) + 2)));
+  return highest;
+}
 
-  const size_t points = model.meanShape.size() / 2;
-  std::vector<float> feature(points * 128);
-  // One buffer for every descriptor of the face: a point whose descriptor is
-  // left unchanged repeats the bytes of the one before it.
-  uint8_t descriptor[128] = {};
+std::vector<float> regressShapes(const SDMModel& model, const cv::Mat& image,
+                                 const std::vector<std::vector<float>>& starts) {
+  FaceFeatures features(image, starts.at(0), model.scalesPerOctave, highestStageLevel(model));
+  const float padding = static_cast<float>(features.pad());
+  std::vector<float> feature(model.meanShape.size() / 2 * 128);
   const mp::matrix noBias;
   const bool useBiases = !model.stageMatrices.empty() && !model.stageBiases.empty();
 
@@ -168,14 +181,7 @@ std::vector<float> regressShapes(const SDMModel& model, const cv::Mat& image,
   for (std::vector<float>& shape : shapes) {
     for (float& v : shape) v += padding;
     for (size_t i = 0; i < model.stageMaps.size(); ++i) {
-      const int32_t level = stageLevel(model, i);
-      for (size_t j = 0; j < points; ++j) {
-        float norm = 0.0f;
-        pyramid.computeDescriptor(shape[2 * j], shape[2 * j + 1], static_cast<float>(level), norm,
-                                  descriptor);
-        float* row = feature.data() + j * 128;
-        for (int t = 0; t < 128; ++t) row[t] = static_cast<float>(descriptor[t]) * 0.00390625f;
-      }
+      features.compute(shape, stageLevel(model, i), feature.data());
       const mp::matrix& bias =
           useBiases && i < model.stageBiases.size() ? model.stageBiases[i] : noBias;
       applyStage(feature.data(), model.stageMaps[i], bias, shape);

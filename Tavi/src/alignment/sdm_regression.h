@@ -1,11 +1,13 @@
 #ifndef TAVI_SRC_ALIGNMENT_SDM_REGRESSION_H_
 #define TAVI_SRC_ALIGNMENT_SDM_REGRESSION_H_
 
+#include <cstdint>
 #include <vector>
 
 #include <opencv2/core.hpp>
 
 #include "alignment/sdm_model.h"
+#include "alignment/sift_pyramid.h"
 #include "mp/matrix.h"
 #include "mp/pca_map.h"
 
@@ -69,6 +71,33 @@ std::vector<std::vector<float>> startShapes(const std::vector<float>& meanShape,
 // width, more if a point lies further outside. padded is the image with that
 // many black pixels on all four sides, or image itself when the padding is 0.
 int padForShape(const cv::Mat& image, const std::vector<float>& shape, cv::Mat& padded);
+
+// The descriptors of shapes on one face, as the regression computes them:
+// the image padded for the first start, its descriptor pyramid, and one
+// 128-byte buffer for every descriptor of the face (a point whose descriptor
+// is left unchanged repeats the bytes of the one computed before it, also
+// across shapes and stages). The trainers compute their features here too.
+class FaceFeatures {
+ public:
+  // Builds the pyramid with scalesPerOctave scales per octave and its levels
+  // up to highestLevel.
+  FaceFeatures(const cv::Mat& image, const std::vector<float>& start, int32_t scalesPerOctave,
+               int32_t highestLevel);
+  // The padding on each side; shapes given to compute are in padded pixels.
+  int pad() const { return pad_; }
+  // The feature row of the shape at a pyramid level: each point's
+  // descriptor bytes divided by 256, 128 floats a point.
+  void compute(const std::vector<float>& paddedShape, int32_t level, float* feature);
+
+ private:
+  cv::Mat padded_;
+  int pad_;
+  SiftPyramid pyramid_;
+  uint8_t descriptor_[128] = {};
+};
+
+// The highest pyramid level that a stage of the model reads.
+int32_t highestStageLevel(const SDMModel& model);
 
 // Runs every start through all stages of model on image and returns the
 // coordinate-wise median of the results, in image's pixels.
