@@ -11,6 +11,23 @@ void readInt32(std::istream& stream, int32_t& value) {
   stream.read(reinterpret_cast<char*>(&value), sizeof value);
 }
 
+void writeInt32(std::ostream& stream, int32_t value) {
+  stream.write(reinterpret_cast<const char*>(&value), sizeof value);
+}
+
+template <typename Record>
+void writeRecords(std::ostream& stream, const std::vector<Record>& records) {
+  writeInt32(stream, static_cast<int32_t>(records.size()));
+  for (const Record& record : records) record.write(stream);
+}
+
+template <typename Value>
+void writeValues(std::ostream& stream, const std::vector<Value>& values) {
+  writeInt32(stream, static_cast<int32_t>(values.size()));
+  stream.write(reinterpret_cast<const char*>(values.data()),
+               static_cast<std::streamsize>(values.size() * sizeof(Value)));
+}
+
 }  // namespace
 
 SDMModel* sdmModel = nullptr;
@@ -68,6 +85,19 @@ bool readSDMModel(const std::string& path, SDMModel& model) {
 
   stream.close();
   return true;
+}
+
+bool writeSDMModel(std::ostream& stream, const SDMModel& model) {
+  writeRecords(stream, model.stageMatrices);
+  writeRecords(stream, model.stageBiases);
+  writeValues(stream, model.meanShape);
+  writeValues(stream, model.auxShape);
+  writeRecords(stream, model.stageMaps);
+  writeValues(stream, model.stageLevels);
+  for (int32_t value : {0, model.modelFlag, model.scalesPerOctave, model.faceWidth}) {
+    writeInt32(stream, value);
+  }
+  return static_cast<bool>(stream);
 }
 
 }  // namespace SDMCore

@@ -2,6 +2,7 @@
 #define TAVI_SRC_ALIGNMENT_SDM_MODEL_H_
 
 #include <cstdint>
+#include <ostream>
 #include <string>
 #include <vector>
 
@@ -43,6 +44,10 @@ struct SDMModel {
 // or malformed file leaves the stream failed, later reads fetch nothing, and
 // the result is still true.
 bool readSDMModel(const std::string& path, SDMModel& model);
+
+// Writes model in the file layout readSDMModel reads (the discarded integer
+// as 0). Returns whether the stream took all of it.
+bool writeSDMModel(std::ostream& stream, const SDMModel& model);
 
 // The process-wide model of loadSDMModel; null when none is loaded.
 extern SDMModel* sdmModel;

@@ -1,0 +1,173 @@
+// Trains the 68-point landmark model from the data folder, on boxes from the
+// shipped face detector, and writes the model file align68Points reads:
+//
+//   build/tools/train_landmarks --data ../shared/data/ --cascade Tavi/public/
+//       --out Tavi/public/landmarks.sdm --seed 1
+//
+// Prints the boxes found, the samples, each stage's training error and the
+// wall time. The file is written under a temporary name and renamed when
+// complete.
+#include <boost/program_options.hpp>
+
+#include <chrono>
+#include <cstdio>
+#include <filesystem>
+#include <fstream>
+#include <iostream>
+#include <random>
+#include <sstream>
+#include <string>
+#include <vector>
+
+#include "alignment/sdm_model.h"
+#include "command_line.h"
+#include "detector_training/face_box.h"
+#include "detector_training/training_data.h"
+#include "landmark_training/landmark_sample.h"
+#include "landmark_training/sdm_training.h"
+#include "landmark_training/training_boxes.h"
+
+namespace po = boost::program_options;
+
+namespace {
+
+double secondsSince(std::chrono::steady_clock::time_point start) {
+  return std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
+}
+
+std::vector<float> flatPoints(const std::vector<cv::Point2f>& points) {
+  std::vector<float> flat;
+  for (const cv::Point2f& point : points) {
+    flat.push_back(point.x);
+    flat.push_back(point.y);
+  }
+  return flat;
+}
+
+std::vector<int32_t> parseLevels(const std::string& text) {
+  std::vector<int32_t> levels;
+  std::stringstream stream(text);
+  std::string item;
+  while (std::getline(stream, item, ',')) {
+    levels.push_back(std::stoi(item));
+  }
+  if (levels.empty()) {
+    throw po::error("--levels needs at least one stage");
+  }
+  return levels;
+}
+
+tavilib::Rectangle<float> mirrored(const tavilib::Rectangle<float>& box, int columns) {
+  return {static_cast<float>(columns) - box.right, box.top, static_cast<float>(columns) - box.left,
+          box.bottom};
+}
+
+}  // namespace
+
+int main(int argc, char** argv) {
+  std::string dataRoot;
+  std::string cascadeRoot;
+  std::string output;
+  std::string levels;
+  unsigned seed = 1;
+  landmarks::SdmSettings settings;
+  po::options_description described("train_landmarks: trains the 68-point landmark model");
+  described.add_options()("help", "this text")(
+      "data", po::value<std::string>(&dataRoot)->default_value("../shared/data/"),
+      "the data folder (ending in a separator)")(
+      "cascade", po::value<std::string>(&cascadeRoot)->default_value("Tavi/public/"),
+      "the detector's model folder, whose boxes the model learns from")(
+      "out", po::value<std::string>(&output)->default_value("Tavi/public/landmarks.sdm"),
+      "the model file")(
+      "levels", po::value<std::string>(&levels)->default_value("2,2,1,1"),
+      "pyramid level of each stage, comma-separated")(
+      "scales-per-octave", po::value<int32_t>(&settings.scalesPerOctave)->default_value(3), "")(
+      "face-width", po::value<int32_t>(&settings.faceWidth)->default_value(100),
+      "face box width the face is normalised to")(
+      "ridge", po::value<double>(&settings.ridge)->default_value(1e-3), "ridge strength per shape")(
+      "seed", po::value<unsigned>(&seed)->default_value(1), "random seed");
+  try {
+    if (!tools::parseCommandLine(argc, argv, described)) {
+      return 0;
+    }
+    settings.stageLevels = parseLevels(levels);
+    const auto start = std::chrono::steady_clock::now();
+    const std::string csv = dataRoot + "faces68/train.csv";
+    std::vector<cv::Mat> images;
+    std::vector<std::vector<float>> truths;
+    std::vector<cv::Rect2f> faces;
+    for (const training::LabelledFace& face : training::readLabelledFaces(csv)) {
+      images.push_back(training::readImage(dataRoot + "faces68/" + face.file));
+      truths.push_back(flatPoints(face.points));
+      faces.push_back(training::faceBoxFromPoints(face.points));
+    }
+    const std::vector<tavilib::Rectangle<float>> found =
+        landmarks::detectorBoxes(cascadeRoot, images, faces);
+    const landmarks::BoxError error = landmarks::measureBoxError(found, faces);
+    size_t detected = 0;
+    for (const auto& box : found) detected += box.right > box.left;
+    std::printf("%zu faces, %zu found by the detector; its boxes against the face box: centre "
+                "%+.3f %+.3f (spread %.3f %.3f), log size %+.3f (spread %.3f) (%.0f s)\n",
+                faces.size(), detected, static_cast<double>(error.meanShift.x),
+                static_cast<double>(error.meanShift.y), static_cast<double>(error.shiftSpread.x),
+                static_cast<double>(error.shiftSpread.y), static_cast<double>(error.meanLogScale),
+                static_cast<double>(error.logScaleSpread), secondsSince(start));
+
+    // Each face twice, upright and mirrored, each with the detector's box
+    // (or the face box moved by the detector's error where it found none)
+    // and once more with a box moved by that error.
+    std::mt19937 random(seed);
+    std::vector<landmarks::LandmarkSample> samples;
+    size_t skipped = 0;
+    for (size_t i = 0; i < images.size(); ++i) {
+      cv::Mat flipped;
+      std::vector<float> flippedTruth;
+      landmarks::mirrorFace(images[i], truths[i], &flipped, &flippedTruth);
+      const bool hasBox = found[i].right > found[i].left;
+      const tavilib::Rectangle<float> box =
+          hasBox ? found[i] : landmarks::jitteredBox(faces[i], error, random);
+      const cv::Rect2f flippedFace(static_cast<float>(images[i].cols) - faces[i].br().x,
+                                   faces[i].y, faces[i].width, faces[i].height);
+      const std::pair<const cv::Mat*, const std::vector<float>*> views[] = {
+          {&images[i], &truths[i]}, {&flipped, &flippedTruth}};
+      const tavilib::Rectangle<float> boxes[] = {
+          box, landmarks::jitteredBox(faces[i], error, random),
+          mirrored(box, images[i].cols), landmarks::jitteredBox(flippedFace, error, random)};
+      for (int b = 0; b < 4; ++b) {
+        landmarks::LandmarkSample sample;
+        if (landmarks::makeSample(*views[b / 2].first, boxes[b], *views[b / 2].second,
+                                  settings.faceWidth, &sample)) {
+          samples.push_back(std::move(sample));
+        } else {
+          ++skipped;
+        }
+      }
+    }
+    std::printf("%zu samples, %zu skipped (crop outside the image) (%.0f s)\n", samples.size(),
+                skipped, secondsSince(start));
+    std::fflush(stdout);
+
+    const SDMCore::SDMModel model =
+        landmarks::trainSdm(samples, settings, [&](int stage, double trainingError) {
+          std::printf("stage %d: mean training error %.4f (%.0f s)\n", stage + 1, trainingError,
+                      secondsSince(start));
+          std::fflush(stdout);
+        });
+    const std::string temporary = output + ".tmp";
+    {
+      std::ofstream file(temporary, std::ios::binary);
+      if (!SDMCore::writeSDMModel(file, model) || !file.flush()) {
+        throw std::runtime_error("cannot write " + temporary);
+      }
+    }
+    std::filesystem::rename(temporary, output);
+    std::printf("model written to %s; wall time %.0f s\n", output.c_str(), secondsSince(start));
+  } catch (const po::error& problem) {
+    std::cerr << "train_landmarks: " << problem.what() << "\n" << described << "\n";
+    return 2;
+  } catch (const std::exception& problem) {
+    std::cerr << "train_landmarks: " << problem.what() << "\n";
+    return 1;
+  }
+  return 0;
+}
