@@ -1,0 +1,144 @@
+#include <gtest/gtest.h>
+
+#include <opencv2/core.hpp>
+
+#include <cmath>
+#include <filesystem>
+#include <fstream>
+#include <random>
+#include <string>
+#include <vector>
+
+#include "alignment/alignment_frame.h"
+#include "alignment/sdm_regression.h"
+#include "detector_training/face_box.h"
+#include "detector_training/training_data.h"
+#include "landmark_training/landmark_sample.h"
+#include "landmark_training/sdm_training.h"
+#include "temp_dir.h"
+
+namespace landmarks {
+namespace {
+
+TEST(FitStageTest, RecoversAnExactlyLinearMap) {
+  const size_t rows = 400;
+  const size_t columns = 12;
+  const size_t outputs = 3;
+  std::mt19937 random(5);
+  std::uniform_real_distribution<float> draw(0.0f, 1.0f);
+  std::vector<float> projection(columns * outputs);
+  for (float& p : projection) p = draw(random) - 0.5f;
+  const float bias[outputs] = {2.0f, -1.0f, 0.5f};
+  std::vector<float> features(rows * columns);
+  for (float& f : features) f = draw(random);
+  std::vector<float> targets(rows * outputs);
+  for (size_t r = 0; r < rows; ++r) {
+    for (size_t q = 0; q < outputs; ++q) {
+      // The map applies to centred features: the targets' mean is the bias
+      // only if the features' mean is taken out, which fitStage does.
+      float sum = bias[q];
+      for (size_t c = 0; c < columns; ++c) {
+        sum += (features[r * columns + c] - 0.5f) * projection[c * outputs + q];
+      }
+      targets[r * outputs + q] = sum;
+    }
+  }
+  mp::pca_map map;
+  mp::matrix fittedBias;
+  fitStage(features, targets, rows, columns, outputs, 1e-9, &map, &fittedBias);
+  for (size_t i = 0; i < projection.size(); ++i) {
+    EXPECT_NEAR(map.projection.data()[i], projection[i], 1e-3) << i;
+  }
+  // bias + (x - mean) P reproduces every target.
+  for (size_t q = 0; q < outputs; ++q) {
+    float meanPart = 0.0f;
+    for (size_t c = 0; c < columns; ++c) {
+      meanPart += (map.mean.data()[c] - 0.5f) * projection[c * outputs + q];
+    }
+    EXPECT_NEAR(fittedBias.data()[q], bias[q] + meanPart, 1e-3) << q;
+  }
+}
+
+const char kValidationCsv[] = TAVI_SOURCE_DIR "/../shared/data/faces68/val.csv";
+
+std::vector<float> Flat(const std::vector<cv::Point2f>& points) {
+  std::vector<float> flat;
+  for (const cv::Point2f& p : points) {
+    flat.push_back(p.x);
+    flat.push_back(p.y);
+  }
+  return flat;
+}
+
+// A few held-out faces, prepared from their face boxes.
+std::vector<LandmarkSample> RealSamples(size_t count) {
+  std::vector<LandmarkSample> samples;
+  if (!std::filesystem::exists(kValidationCsv)) {
+    return samples;
+  }
+  for (const training::LabelledFace& face : training::readLabelledFaces(kValidationCsv)) {
+    const cv::Mat image = training::readImage(std::filesystem::path(kValidationCsv).parent_path() / face.file);
+    const cv::Rect2f box = training::faceBoxFromPoints(face.points);
+    LandmarkSample sample;
+    if (makeSample(image, {box.x, box.y, box.br().x, box.br().y}, Flat(face.points), 100, &sample)) {
+      samples.push_back(sample);
+    }
+    if (samples.size() == count) break;
+  }
+  return samples;
+}
+
+TEST(TrainSdmTest, FeaturesAreTheRegressionsOwnAndAStageMovesShapesToTheTruth) {
+  const std::vector<LandmarkSample> samples = RealSamples(20);
+  if (samples.empty()) {
+    GTEST_SKIP() << "no validation data at " << kValidationCsv;
+  }
+  SdmSettings settings;
+  settings.stageLevels = {2};
+  settings.ridge = 1e-2;
+  std::vector<double> errors;
+  const SDMCore::SDMModel model =
+      trainSdm(samples, settings, [&](int, double error) { errors.push_back(error); });
+  ASSERT_EQ(model.stageMaps.size(), 1u);
+  ASSERT_EQ(model.stageMaps[0].projection.rows(), 68 * 128);
+
+  // The model, written and read back, moves the starts of a face it learnt
+  // towards the truth.
+  TempDir dir;
+  const std::string path = dir.path() + "/model.sdm";
+  {
+    std::ofstream file(path, std::ios::binary);
+    ASSERT_TRUE(SDMCore::writeSDMModel(file, model));
+  }
+  SDMCore::SDMModel loaded;
+  ASSERT_TRUE(SDMCore::readSDMModel(path, loaded));
+  const LandmarkSample& face = samples[3];
+  const std::vector<std::vector<float>> starts = SDMCore::startShapes(loaded.meanShape, face.faceRect);
+  const double before = normalisedError(starts[1], face.truth);
+  const double after = normalisedError(SDMCore::regressShapes(loaded, face.image, {starts[1]}), face.truth);
+  EXPECT_LT(after, 0.5 * before);
+  EXPECT_LT(errors[0], 0.5 * normalisedError(starts[0], face.truth) + 0.05);
+
+  // A stage whose projection copies 136 chosen feature elements into the
+  // shape shows the features the regression computes for a start: they are
+  // the ones the trainer computes through FaceFeatures.
+  SDMCore::SDMModel probe = loaded;
+  probe.stageMatrices.clear();
+  probe.stageMaps[0].mean.fill(0.0f);
+  probe.stageMaps[0].projection.fill(0.0f);
+  for (int q = 0; q < 136; ++q) {
+    probe.stageMaps[0].projection.data()[(q * 64 + q % 128) * 136 + q] = 1.0f;
+  }
+  const std::vector<float> moved = SDMCore::regressShapes(probe, face.image, {starts[0]});
+  SDMCore::FaceFeatures features(face.image, starts[0], 3, 2);
+  std::vector<float> padded = starts[0];
+  for (float& v : padded) v += static_cast<float>(features.pad());
+  std::vector<float> row(68 * 128);
+  features.compute(padded, 2, row.data());
+  for (int q = 0; q < 136; ++q) {
+    EXPECT_NEAR(moved[q] - starts[0][q], row[q * 64 + q % 128], 1e-4f) << q;
+  }
+}
+
+}  // namespace
+}  // namespace landmarks
