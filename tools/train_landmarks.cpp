@@ -15,6 +15,7 @@
 #include <fstream>
 #include <iostream>
 #include <random>
+#include <set>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -70,6 +71,7 @@ int main(int argc, char** argv) {
   std::string output;
   std::string levels;
   unsigned seed = 1;
+  bool withLfw = false;
   landmarks::SdmSettings settings;
   po::options_description described("train_landmarks: trains the 68-point landmark model");
   described.add_options()("help", "this text")(
@@ -85,21 +87,34 @@ int main(int argc, char** argv) {
       "face-width", po::value<int32_t>(&settings.faceWidth)->default_value(100),
       "face box width the face is normalised to")(
       "ridge", po::value<double>(&settings.ridge)->default_value(1e-3), "ridge strength per shape")(
-      "seed", po::value<unsigned>(&seed)->default_value(1), "random seed");
+      "seed", po::value<unsigned>(&seed)->default_value(1), "random seed")(
+      "lfw", po::bool_switch(&withLfw),
+      "also learn from lfw68 (machine-made points), without the persons of faces68 val");
   try {
     if (!tools::parseCommandLine(argc, argv, described)) {
       return 0;
     }
     settings.stageLevels = parseLevels(levels);
     const auto start = std::chrono::steady_clock::now();
-    const std::string csv = dataRoot + "faces68/train.csv";
     std::vector<cv::Mat> images;
     std::vector<std::vector<float>> truths;
     std::vector<cv::Rect2f> faces;
-    for (const training::LabelledFace& face : training::readLabelledFaces(csv)) {
-      images.push_back(training::readImage(dataRoot + "faces68/" + face.file));
-      truths.push_back(flatPoints(face.points));
-      faces.push_back(training::faceBoxFromPoints(face.points));
+    std::set<std::string> validationPersons;
+    for (const training::LabelledFace& face :
+         training::readLabelledFaces(dataRoot + "faces68/val.csv")) {
+      validationPersons.insert(face.person);
+    }
+    for (const char* folder : withLfw ? std::vector<const char*>{"faces68/", "lfw68/"}
+                                      : std::vector<const char*>{"faces68/"}) {
+      const std::string csv = dataRoot + folder +
+                              (std::string(folder) == "faces68/" ? "train.csv" : "labels.csv");
+      for (const training::LabelledFace& face : training::readLabelledFaces(csv)) {
+        if (validationPersons.count(face.person) == 0) {
+          images.push_back(training::readImage(dataRoot + folder + face.file));
+          truths.push_back(flatPoints(face.points));
+          faces.push_back(training::faceBoxFromPoints(face.points));
+        }
+      }
     }
     const std::vector<tavilib::Rectangle<float>> found =
         landmarks::detectorBoxes(cascadeRoot, images, faces);

@@ -3,6 +3,7 @@
 #include <opencv2/imgcodecs.hpp>
 #include <unistd.h>
 
+#include <cmath>
 #include <filesystem>
 #include <fstream>
 #include <sstream>
@@ -101,6 +102,31 @@ TEST(ShippedCascadeTest, FolderAndBuiltInLoadsFindTheSameFaces) {
           << "point " << point;
     }
   }
+}
+
+TEST(ShippedLandmarksTest, PlaceTheHeldOutPointsFromTheDetectorsBoxes) {
+  const std::vector<Frame> frames = ValidationFrames(4);
+  if (frames.empty()) {
+    GTEST_SKIP() << "no validation data at " << kValidationCsv;
+  }
+  Detector detector;
+  ASSERT_EQ(detector.load(DetectorParams(kModelRoot, "cascade.list")), STATUS_OK);
+  ASSERT_EQ(loadSDMModel(kModelRoot, "landmarks.sdm"), STATUS_OK);
+  for (const Frame& frame : frames) {
+    const std::vector<Detection> faces = Detect(detector, frame.pixels);
+    ASSERT_FALSE(faces.empty());
+    Image wrapped{frame.pixels.cols, frame.pixels.rows, 0, frame.pixels.data};
+    std::vector<float> points;
+    ASSERT_EQ(align68Points(wrapped, faces[0].box, points), STATUS_OK);
+    ASSERT_EQ(points.size(), 136u);
+    const float eyes = std::hypot(frame.points[72] - frame.points[90], frame.points[73] - frame.points[91]);
+    float error = 0.0f;
+    for (int k = 0; k < 68; ++k) {
+      error += std::hypot(points[2 * k] - frame.points[2 * k], points[2 * k + 1] - frame.points[2 * k + 1]);
+    }
+    EXPECT_LT(error / 68.0f / eyes, 0.12f);
+  }
+  unloadSDMModel();
 }
 
 }  // namespace
