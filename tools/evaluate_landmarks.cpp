@@ -25,8 +25,7 @@
 
 #include "alignment/sdm_model.h"
 #include "command_line.h"
-#include "detector_training/face_box.h"
-#include "detector_training/training_data.h"
+#include "landmark_training/labelled_images.h"
 #include "landmark_training/sdm_training.h"
 #include "landmark_training/training_boxes.h"
 #include "tavilib.h"
@@ -153,15 +152,6 @@ void drawCurves(const std::vector<std::pair<std::string, std::vector<double>>>& 
   }
 }
 
-std::vector<float> flatPoints(const std::vector<cv::Point2f>& points) {
-  std::vector<float> flat;
-  for (const cv::Point2f& point : points) {
-    flat.push_back(point.x);
-    flat.push_back(point.y);
-  }
-  return flat;
-}
-
 // Aligns every face from its box and sums up the errors.
 Summary measure(const std::vector<cv::Mat>& images, const std::vector<std::vector<float>>& truths,
                 const std::vector<tavilib::Rectangle<float>>& boxes) {
@@ -220,15 +210,11 @@ int main(int argc, char** argv) {
     if (!tools::parseCommandLine(argc, argv, described)) {
       return 0;
     }
-    std::vector<cv::Mat> images;
-    std::vector<std::vector<float>> truths;
-    std::vector<cv::Rect2f> faces;
-    for (const training::LabelledFace& face :
-         training::readLabelledFaces(dataRoot + "faces68/val.csv")) {
-      images.push_back(training::readImage(dataRoot + "faces68/" + face.file));
-      truths.push_back(flatPoints(face.points));
-      faces.push_back(training::faceBoxFromPoints(face.points));
-    }
+    landmarks::LabelledImages labelled;
+    landmarks::addLabelledImages(dataRoot + "faces68/val.csv", {}, &labelled);
+    const std::vector<cv::Mat>& images = labelled.images;
+    const std::vector<std::vector<float>>& truths = labelled.truths;
+    const std::vector<cv::Rect2f>& faces = labelled.faces;
     const std::vector<tavilib::Rectangle<float>> detected =
         landmarks::detectorBoxes(cascadeRoot, images, faces);
     std::vector<tavilib::Rectangle<float>> convention;

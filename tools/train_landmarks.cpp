@@ -22,8 +22,7 @@
 
 #include "alignment/sdm_model.h"
 #include "command_line.h"
-#include "detector_training/face_box.h"
-#include "detector_training/training_data.h"
+#include "landmark_training/labelled_images.h"
 #include "landmark_training/landmark_sample.h"
 #include "landmark_training/sdm_training.h"
 #include "landmark_training/training_boxes.h"
@@ -34,15 +33,6 @@ namespace {
 
 double secondsSince(std::chrono::steady_clock::time_point start) {
   return std::chrono::duration<double>(std::chrono::steady_clock::now() - start).count();
-}
-
-std::vector<float> flatPoints(const std::vector<cv::Point2f>& points) {
-  std::vector<float> flat;
-  for (const cv::Point2f& point : points) {
-    flat.push_back(point.x);
-    flat.push_back(point.y);
-  }
-  return flat;
 }
 
 std::vector<int32_t> parseLevels(const std::string& text) {
@@ -96,26 +86,16 @@ int main(int argc, char** argv) {
     }
     settings.stageLevels = parseLevels(levels);
     const auto start = std::chrono::steady_clock::now();
-    std::vector<cv::Mat> images;
-    std::vector<std::vector<float>> truths;
-    std::vector<cv::Rect2f> faces;
-    std::set<std::string> validationPersons;
-    for (const training::LabelledFace& face :
-         training::readLabelledFaces(dataRoot + "faces68/val.csv")) {
-      validationPersons.insert(face.person);
+    landmarks::LabelledImages labelled;
+    const std::set<std::string> validationPersons =
+        landmarks::personsOf(dataRoot + "faces68/val.csv");
+    landmarks::addLabelledImages(dataRoot + "faces68/train.csv", validationPersons, &labelled);
+    if (withLfw) {
+      landmarks::addLabelledImages(dataRoot + "lfw68/labels.csv", validationPersons, &labelled);
     }
-    for (const char* folder : withLfw ? std::vector<const char*>{"faces68/", "lfw68/"}
-                                      : std::vector<const char*>{"faces68/"}) {
-      const std::string csv = dataRoot + folder +
-                              (std::string(folder) == "faces68/" ? "train.csv" : "labels.csv");
-      for (const training::LabelledFace& face : training::readLabelledFaces(csv)) {
-        if (validationPersons.count(face.person) == 0) {
-          images.push_back(training::readImage(dataRoot + folder + face.file));
-          truths.push_back(flatPoints(face.points));
-          faces.push_back(training::faceBoxFromPoints(face.points));
-        }
-      }
-    }
+    const std::vector<cv::Mat>& images = labelled.images;
+    const std::vector<std::vector<float>>& truths = labelled.truths;
+    const std::vector<cv::Rect2f>& faces = labelled.faces;
     const std::vector<tavilib::Rectangle<float>> found =
         landmarks::detectorBoxes(cascadeRoot, images, faces);
     const landmarks::BoxError error = landmarks::measureBoxError(found, faces);
