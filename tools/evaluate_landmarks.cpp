@@ -142,7 +142,7 @@ void drawCurves(const std::vector<std::pair<std::string, std::vector<double>>>& 
       cv::line(canvas, previous, point, colours[c % 2], 2);
       previous = point;
     }
-    cv::putText(canvas, curves[c].first, cv::Point(margin + 300, margin + 30 + 25 * static_cast<int>(c)),
+    cv::putText(canvas, curves[c].first, toPoint(0.09, 0.3 - 0.07 * static_cast<double>(c)),
                 cv::FONT_HERSHEY_SIMPLEX, 0.5, colours[c % 2]);
   }
   cv::putText(canvas, "share of faces68 val faces", cv::Point(margin, margin - 20),

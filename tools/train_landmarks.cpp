@@ -71,12 +71,12 @@ int main(int argc, char** argv) {
       "the detector's model folder, whose boxes the model learns from")(
       "out", po::value<std::string>(&output)->default_value("Tavi/public/landmarks.sdm"),
       "the model file")(
-      "levels", po::value<std::string>(&levels)->default_value("2,2,1,1"),
+      "levels", po::value<std::string>(&levels)->default_value("2,2,1,1,0"),
       "pyramid level of each stage, comma-separated")(
       "scales-per-octave", po::value<int32_t>(&settings.scalesPerOctave)->default_value(3), "")(
       "face-width", po::value<int32_t>(&settings.faceWidth)->default_value(100),
       "face box width the face is normalised to")(
-      "ridge", po::value<double>(&settings.ridge)->default_value(1e-3), "ridge strength per shape")(
+      "ridge", po::value<double>(&settings.ridge)->default_value(1e-2), "ridge strength per shape")(
       "seed", po::value<unsigned>(&seed)->default_value(1), "random seed")(
       "lfw", po::bool_switch(&withLfw),
       "also learn from lfw68 (machine-made points), without the persons of faces68 val");

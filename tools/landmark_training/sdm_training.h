@@ -11,12 +11,12 @@
 namespace landmarks {
 
 struct SdmSettings {
-  std::vector<int32_t> stageLevels{2, 2, 1, 1};
+  std::vector<int32_t> stageLevels{2, 2, 1, 1, 0};
   int32_t scalesPerOctave = 3;
   int32_t faceWidth = 100;
   // Ridge strength per training shape: the normal equations get ridge times
   // the number of shapes on their diagonal.
-  double ridge = 1e-3;
+  double ridge = 1e-2;
 };
 
 // Mean error of shapes against their samples' truth after a stage, in units
