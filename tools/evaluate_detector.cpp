@@ -28,7 +28,7 @@
 #include "detector_training/counted_detection.h"
 #include "detector_training/face_box.h"
 #include "detector_training/parallel_items.h"
-#include "detector_training/scan_settings.h"
+#include "detector/scan_settings.h"
 #include "detector_training/training_data.h"
 #include "nn/net.h"
 
@@ -182,13 +182,15 @@ int main(int argc, char** argv) {
       state.ready = true;
     }
     const size_t stages = states[0].stages.size();
-    const int declared = states[0].stages[0].net->net_input_blobs()[0]->width();
+    const nn::Net<float>& scan = *states[0].stages[0].net;
     std::printf("scan settings: minimum face %d px (more where a base image would exceed the "
-                "scan net's %d px), scale step %g, window %d, no enlargement\n",
-                minFace, declared, static_cast<double>(training::kScaleStep),
-                training::kWindowSize);
+                "scan net's %d by %d), scale step %g, window %d, no enlargement\n",
+                minFace, scan.declared_input_width(), scan.declared_input_height(),
+                static_cast<double>(tavilib::kScaleStep), tavilib::kWindowSize);
     auto settingsFor = [&](const cv::Mat& image) {
-      return training::scanSettingsFor(image.cols, image.rows, minFace, declared);
+      return tavilib::fittingScanSettings(image.cols, image.rows, minFace,
+                                          scan.declared_input_width(),
+                                          scan.declared_input_height());
     };
 
     const size_t faces = validation.faces.size();
@@ -246,7 +248,7 @@ int main(int argc, char** argv) {
     for (const cv::Mat& image : validation.negatives) {
       megapixels += static_cast<double>(image.total()) / 1e6;
       largestMinFace = std::max(
-          largestMinFace, training::minimumFaceOf(settingsFor(image), image.cols, image.rows));
+          largestMinFace, tavilib::minimumFaceOf(settingsFor(image), image.cols, image.rows));
     }
     const size_t missed = faces - faceScores.size();
     size_t misplaced = 0;

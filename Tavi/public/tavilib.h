@@ -143,10 +143,29 @@ TAVI_EXPORT void unloadDetector(Detector& detector);
 // last load failed, gives STATUS_DETECTOR_NOT_READY and leaves detections as
 // they were.
 // REQUIRES: params make the base image fit the first network's declared input
-//   (roughly windowSize / minFaceRatio at most 384 for the built-in cascade).
+//   (384 by 384 with the built-in load, 640 by 640 from the shipped folder);
+//   scanSettingsFor gives such settings.
 // REQUIRES: no other thread uses the same Detector during the call.
 TAVI_EXPORT Status detect(const Image& image, const Detector& detector,
                           std::vector<Detection>& detections, const CascadeParameter& params);
+
+// Scan settings for detect, chosen for one loaded detector and one image size.
+struct ScanSettings {
+  CascadeParameter params;
+  // The smallest face, in pixels of the image, that params look for: the one
+  // asked for, or the smallest larger one whose base image fits the scan
+  // net's declared input (a large image searched for small faces).
+  int32_t minFace;
+};
+
+// Fills settings to find faces of minFace pixels and up in images of width by
+// height pixels with detector: the image is scanned at its own size (faces
+// below the 12-pixel scan window by enlarging it), pyramid levels a factor 1.2
+// apart. Gives STATUS_DETECTOR_NOT_READY, and leaves settings as they were,
+// when the detector holds no completed load.
+// Throws std::invalid_argument when width, height or minFace is below 1.
+TAVI_EXPORT Status scanSettingsFor(const Detector& detector, int32_t width, int32_t height,
+                                   int32_t minFace, ScanSettings& settings);
 
 // Loads the alignment model from the file folder + "/" + file, replacing any
 // model loaded before (which is dropped even if this load then fails).

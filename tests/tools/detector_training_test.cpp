@@ -14,7 +14,6 @@
 #include "detector/window_grading.h"
 #include "detector_training/face_box.h"
 #include "detector_training/net_trainer.h"
-#include "detector_training/scan_settings.h"
 #include "detector_training/training_data.h"
 #include "detector_training/window_sampler.h"
 #include "nn/net.h"
@@ -80,28 +79,6 @@ TEST(CalibrationSquareTest, TheDetectorsCorrectionOfEachClassBringsItsSquareBack
       EXPECT_NE(window.x + 100 * window.y + 10000 * window.width,
                 back.x + 100 * back.y + 10000 * back.width)
           << "class " << k << " moves its window";
-    }
-  }
-}
-
-TEST(ScanSettingsTest, GiveExactlyTheMinimumFaceAndABaseInsideTheScanInput) {
-  std::mt19937 random(3);
-  for (int trial = 0; trial < 3000; ++trial) {
-    const int columns = 20 + static_cast<int>(random() % 3000);
-    const int rows = 20 + static_cast<int>(random() % 3000);
-    const int minFace = 12 + static_cast<int>(random() % 150);
-    const tavilib::CascadeParameter settings = scanSettingsFor(columns, rows, minFace, 640);
-    const tavilib::PyramidGeometry geometry =
-        tavilib::computePyramidGeometry(columns, rows, settings);
-    ASSERT_LE(geometry.baseWidth, 640) << columns << "x" << rows << " " << minFace;
-    ASSERT_LE(geometry.baseHeight, 640) << columns << "x" << rows << " " << minFace;
-    const int honoured = minimumFaceOf(settings, columns, rows);
-    ASSERT_GE(honoured, minFace);
-    if (honoured > minFace) {
-      // Only as much larger as the scan input demands.
-      const tavilib::PyramidGeometry smaller = tavilib::computePyramidGeometry(
-          columns, rows, scanSettingsFor(columns, rows, honoured - 1, 100000));
-      ASSERT_GT(std::max(smaller.baseWidth, smaller.baseHeight), 640);
     }
   }
 }
@@ -223,6 +200,34 @@ TEST(NetTrainerTest, LearnsAndExportsAScanNetWhoseStoredResponseVanishes) {
   ASSERT_EQ(fromPrimed.count(), fromPlain.count());
   for (int i = 0; i < fromPlain.count(); ++i) {
     EXPECT_NEAR(fromPrimed.cpu_data()[i], fromPlain.cpu_data()[i], 1e-5f) << i;
+  }
+}
+
+TEST(NetTrainerTest, RaisingTheFaceLogitMovesEveryProbabilityByTheSameOdds) {
+  NetTrainingSettings settings;
+  NetTrainer trainer(tavilib::kStage1NetText, 24, false, settings, std::vector<float>(1728, 0.0f));
+  nn::NetParameter weights = trainer.deployWeights();
+  const double shift = logOdds(0.98f) - logOdds(0.95f);
+  EXPECT_NEAR(shift, 0.9474, 1e-4);
+  nn::NetParameter description;
+  nn::ReadNetParamsFromText(tavilib::kStage1NetText, &description);
+  nn::Net<float> before(description);
+  nn::Net<float> after(description);
+  before.CopyTrainedLayersFrom(weights);
+  raiseFaceLogit(weights, shift);
+  after.CopyTrainedLayersFrom(weights);
+  std::mt19937 random(3);
+  std::uniform_real_distribution<float> pixel(-100.0f, 100.0f);
+  for (int trial = 0; trial < 5; ++trial) {
+    for (nn::Net<float>* net : {&before, &after}) {
+      std::mt19937 same = random;
+      nn::Blob<float>& input = *net->net_input_blobs()[0];
+      std::generate_n(input.mutable_cpu_data(), input.count(), [&] { return pixel(same); });
+    }
+    random.discard(1728);
+    const float p = before.Forward()[0]->cpu_data()[1];
+    const float raised = after.Forward()[0]->cpu_data()[1];
+    EXPECT_NEAR(logOdds(raised), logOdds(p) + shift, 1e-3) << trial;
   }
 }
 

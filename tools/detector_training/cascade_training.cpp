@@ -38,6 +38,10 @@ struct StageSpec {
   const char* text;
   Role role;
   float threshold;
+  // Where the trained net best separates faces from the rest, as a face
+  // probability: at export the face logit is raised so that the shipped
+  // threshold falls there (the odds of the two differ by a constant factor).
+  float decidesAt;
   int epochs;
   NetTrainingSettings settings;
   StageRecipe recipe;
@@ -57,13 +61,13 @@ std::vector<StageSpec> cascadeStages() {
   lastGrader.baseLr = 0.005f;
   lastGrader.positiveWeight = 4.0f;
   return {
-      {"cascades/x16Net-demo", tavilib::kStage0NetText, Role::kScan, 0.4f, 15, scan,
+      {"cascades/x16Net-demo", tavilib::kStage0NetText, Role::kScan, 0.4f, 0.4f, 15, scan,
        {12, 2, {0.2f, 0.15f}, 60, 3, 0, 0, 0.0f}},
-      {"cascades/x32Net", tavilib::kStage1NetText, Role::kGrader, 0.8f, 10, grader,
+      {"cascades/x32Net", tavilib::kStage1NetText, Role::kGrader, 0.8f, 0.8f, 10, grader,
        {24, 2, {0.2f, 0.15f}, 10, 1, 40, 4, 0.5f}},
-      {"cascades/x32Net-x32-3Scales-200", tavilib::kCalibrationNetText, Role::kCalibration, 0.0f, 40,
+      {"cascades/x32Net-x32-3Scales-200", tavilib::kCalibrationNetText, Role::kCalibration, 0.0f, 0.0f, 40,
        calibration, {24, 0, {0.0f, 0.0f}, 0, 0, 0, 0, 0.0f}},
-      {"cascades/x64Net", tavilib::kStage2NetText, Role::kGrader, 0.98f, 7, lastGrader,
+      {"cascades/x64Net", tavilib::kStage2NetText, Role::kGrader, 0.98f, 0.93f, 7, lastGrader,
        {48, 2, {0.1f, 0.1f}, 5, 1, 40, 4, 0.55f, 4}},
   };
 }
@@ -118,7 +122,7 @@ WindowSet windowsOfEpoch(const DetectorData& data, const StageSpec& stage, unsig
   return drawPositives(data, stage.recipe, sampler);
 }
 
-// Pass rates at the stage's threshold (two-class nets) or the share of
+// Pass rates at the stage's decision point (two-class nets) or the share of
 // right classes (calibration).
 void printValidation(NetTrainer& trainer, const WindowSet& validation, const StageSpec& stage) {
   const std::vector<std::vector<float>> probabilities = trainer.probabilities(validation);
@@ -132,7 +136,7 @@ void printValidation(NetTrainer& trainer, const WindowSet& validation, const Sta
     right += best == label;
     nan += std::isnan(p[0]);
     if (stage.role != Role::kCalibration) {
-      passed[label] += p[1] > stage.threshold;
+      passed[label] += p[1] > stage.decidesAt;
     }
   }
   if (stage.role == Role::kCalibration) {
@@ -221,6 +225,9 @@ void trainStage(const StageSpec& stage, unsigned stageSeed, const DetectorData& 
     printValidation(trainer, validationSet, stage);
   }
   files.weights = trainer.deployWeights();
+  if (stage.decidesAt != stage.threshold) {
+    raiseFaceLogit(files.weights, logOdds(stage.threshold) - logOdds(stage.decidesAt));
+  }
   if (stage.role == Role::kCalibration) {
     files.offsetsScales = calibrationTable();
   }

@@ -246,6 +246,25 @@ nn::NetParameter NetTrainer::deployWeights() const {
   return weights;
 }
 
+double logOdds(float probability) {
+  const double p = probability;
+  return std::log(p / (1.0 - p));
+}
+
+void raiseFaceLogit(nn::NetParameter& weights, double shift) {
+  CHECK_GT(weights.layers_size(), 0) << "No layers to shift.";
+  int last = weights.layers_size() - 1;
+  while (last > 0 && weights.layers(last).blobs_size() == 0) {
+    --last;
+  }
+  nn::LayerParameter& layer = *weights.mutable_layers(last);
+  CHECK(layer.type() == nn::LayerParameter::INNER_PRODUCT && layer.blobs_size() == 2 &&
+        layer.blobs(1).data_size() == 2)
+      << "The face logit is the second output of a two-class inner product.";
+  nn::BlobProto& bias = *layer.mutable_blobs(1);
+  bias.set_data(1, static_cast<float>(bias.data(1) + shift));
+}
+
 void NetTrainer::snapshot(const std::string& folder, int epochsDone) const {
   solver_->Snapshot(snapshotName(folder, epochsDone, "weights"),
                     snapshotName(folder, epochsDone, "state"));

@@ -90,6 +90,15 @@ class NetTrainer {
 nn::NetParameter trainingDescription(const std::string& deployText, int batch, int side,
                                      bool scanNet);
 
+// log(p / (1 - p)), in double.
+double logOdds(float probability);
+
+// Adds shift to the face logit (class 1) of a two-class net's weights, the
+// bias of its last layer with weights: every face probability p becomes the
+// one whose log-odds are those of p plus shift.
+// Fatal if that layer is not an inner product with two outputs.
+void raiseFaceLogit(nn::NetParameter& weights, double shift);
+
 }  // namespace training
 
 #endif  // TOOLS_DETECTOR_TRAINING_NET_TRAINER_H_

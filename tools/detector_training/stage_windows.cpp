@@ -7,7 +7,7 @@
 #include "detector_training/cascade_recorder.h"
 #include "detector_training/face_box.h"
 #include "detector_training/parallel_items.h"
-#include "detector_training/scan_settings.h"
+#include "detector/scan_settings.h"
 
 namespace training {
 
@@ -107,7 +107,7 @@ WindowSet negativeImageWindows(const cv::Mat& image, const StageRecipe& recipe,
     if (variant >= 2) {
       cv::resize(seen, seen, cv::Size(), kHalfScaleStep, kHalfScaleStep, cv::INTER_AREA);
     }
-    const auto settings = scanSettingsFor(seen.cols, seen.rows, scan.minFace, scan.maxBase);
+    const auto settings = tavilib::fittingScanSettings(seen.cols, seen.rows, scan.minFace, scan.maxBase, scan.maxBase);
     addMined(set, seen,
              pick(windowsForNextStage(cascade, seen, settings), recipe.minedPerNegativeImage,
                   sampler.random()),
@@ -129,7 +129,8 @@ WindowSet faceImageWindows(const FaceImage& face, const StageRecipe& recipe,
   std::vector<tavilib::Window> positives;
   std::vector<tavilib::Window> negatives;
   const auto settings =
-      scanSettingsFor(face.pixels.cols, face.pixels.rows, scan.minFaceInFaceImages, scan.maxBase);
+      tavilib::fittingScanSettings(face.pixels.cols, face.pixels.rows, scan.minFaceInFaceImages,
+                                   scan.maxBase, scan.maxBase);
   for (const tavilib::Window& window : windowsForNextStage(cascade, face.pixels, settings)) {
     const cv::Rect2f rect = toRect(window);
     const float overlap = intersectionOverUnion(rect, face.box);

@@ -10,7 +10,7 @@
 #include "detector_training/counted_detection.h"
 #include "detector_training/face_box.h"
 #include "detector_training/parallel_items.h"
-#include "detector_training/scan_settings.h"
+#include "detector/scan_settings.h"
 #include "nn/net.h"
 
 namespace landmarks {
@@ -39,7 +39,7 @@ std::vector<tavilib::Rectangle<float>> detectorBoxes(const std::string& cascadeR
     }
     state.ready = true;
   }
-  const int declared = states[0].stages[0].net->net_input_blobs()[0]->width();
+  const nn::Net<float>& scan = *states[0].stages[0].net;
   std::vector<tavilib::Rectangle<float>> found(images.size(), tavilib::Rectangle<float>{0, 0, 0, 0});
   training::forEachItem(images.size(), kWorkers, [&](size_t i, size_t worker) {
     training::StageCounts counts;
@@ -47,7 +47,10 @@ std::vector<tavilib::Rectangle<float>> detectorBoxes(const std::string& cascadeR
     float best = -1.0f;
     for (const tavilib::Detection& detection : training::detectCounting(
              states[worker], image,
-             training::scanSettingsFor(image.cols, image.rows, kMinFace, declared), counts)) {
+             tavilib::fittingScanSettings(image.cols, image.rows, kMinFace,
+                                          scan.declared_input_width(),
+                                          scan.declared_input_height()),
+             counts)) {
       if (detection.score > best &&
           training::intersectionOverUnion(toRect(detection.box), faces[i]) >= kMatchIoU) {
         best = detection.score;

@@ -76,6 +76,10 @@ class Net {
   boost::shared_ptr<Blob<Dtype>> output_blob() const;
 
   const std::vector<Blob<Dtype>*>& net_input_blobs() const { return net_input_blobs_; }
+  // The first input's size as described, whatever AlterInputShape made of it
+  // since; 0 for a net without inputs.
+  int declared_input_width() const { return declaredInputWidth_; }
+  int declared_input_height() const { return declaredInputHeight_; }
   const std::vector<Blob<Dtype>*>& output_blobs() const { return net_output_blobs_; }
   const std::vector<boost::shared_ptr<Layer<Dtype>>>& layers() const { return layers_; }
   const std::vector<std::string>& layer_names() const { return layer_names_; }
@@ -118,6 +122,8 @@ class Net {
   // nothing sets them.
   bool useActiveImages_ = false;
   std::vector<boost::shared_ptr<cv::Mat>> activeImagePtrs_;
+  int declaredInputWidth_ = 0;
+  int declaredInputHeight_ = 0;
   bool firstRun_ = true;
   int firstConvLayerIndex_ = -1;
   // The negated response of the first convolution to a constant image, laid

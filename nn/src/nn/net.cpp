@@ -66,6 +66,10 @@ void Net<Dtype>::Init(const NetParameter& in_param) {
     blob_name_to_idx[blob_name] = i;
     available_blobs.insert(blob_name);
   }
+  if (!net_input_blobs_.empty()) {
+    declaredInputWidth_ = net_input_blobs_[0]->width();
+    declaredInputHeight_ = net_input_blobs_[0]->height();
+  }
 
   bottom_vecs_.resize(param.layers_size());
   top_vecs_.resize(param.layers_size());

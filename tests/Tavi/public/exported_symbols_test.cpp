@@ -43,6 +43,8 @@ TEST(ExportedSymbolsTest, OnlyTheTavilibInterfaceLeavesTheLibrary) {
   EXPECT_THAT(names, testing::Contains("tavilib::Detector::getDetector() const"));
   EXPECT_THAT(names, testing::Contains("tavilib::DetectorParams::DetectorParams(char const* const&, "
                                        "char const* const&)"));
+  EXPECT_THAT(names, testing::Contains("tavilib::scanSettingsFor(tavilib::Detector const&, int, int, "
+                                       "int, tavilib::ScanSettings&)"));
   EXPECT_THAT(names, testing::Contains(testing::StartsWith("tavilib::loadSDMModel(std::")));
   EXPECT_THAT(names, testing::Contains("tavilib::unloadSDMModel()"));
   EXPECT_THAT(names, testing::Contains(testing::StartsWith(

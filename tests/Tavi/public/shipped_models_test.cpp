@@ -7,6 +7,7 @@
 #include <filesystem>
 #include <fstream>
 #include <sstream>
+#include <stdexcept>
 #include <string>
 #include <vector>
 
@@ -102,6 +103,30 @@ TEST(ShippedCascadeTest, FolderAndBuiltInLoadsFindTheSameFaces) {
           << "point " << point;
     }
   }
+}
+
+TEST(ScanSettingsForTest, FitTheLoadedScanNetAndRefuseWhatCannotBeScanned) {
+  Detector none;
+  ScanSettings settings{};
+  EXPECT_EQ(scanSettingsFor(none, 640, 480, 40, settings), STATUS_DETECTOR_NOT_READY);
+  Detector fromFolder;
+  ASSERT_EQ(fromFolder.load(DetectorParams(kModelRoot, "cascade.list")), STATUS_OK);
+  EXPECT_THROW(scanSettingsFor(fromFolder, 0, 480, 40, settings), std::invalid_argument);
+  EXPECT_THROW(scanSettingsFor(fromFolder, 640, 480, 0, settings), std::invalid_argument);
+  // A full-HD photo searched for faces of 40 pixels has a base image of 576
+  // pixels: inside the shipped 640, beyond the built-in 384, where the
+  // smallest face that fits is 1920 * 12 / 384 = 60.
+  ASSERT_EQ(scanSettingsFor(fromFolder, 1920, 1080, 40, settings), STATUS_OK);
+  EXPECT_EQ(settings.minFace, 40);
+  Detector builtIn;
+  ASSERT_EQ(LoadBuiltIn(builtIn), STATUS_OK);
+  ASSERT_EQ(scanSettingsFor(builtIn, 1920, 1080, 40, settings), STATUS_OK);
+  EXPECT_EQ(settings.minFace, 60);
+  // The settings scan a large image with either cascade.
+  const cv::Mat large(1080, 1920, CV_8UC3, cv::Scalar(90, 120, 150));
+  std::vector<Detection> detections;
+  const Image wrapped{large.cols, large.rows, 0, large.data};
+  EXPECT_EQ(detect(wrapped, builtIn, detections, settings.params), STATUS_OK);
 }
 
 TEST(ShippedLandmarksTest, PlaceTheHeldOutPointsFromTheDetectorsBoxes) {
