@@ -149,6 +149,19 @@ TAVI_EXPORT void unloadDetector(Detector& detector);
 TAVI_EXPORT Status detect(const Image& image, const Detector& detector,
                           std::vector<Detection>& detections, const CascadeParameter& params);
 
+// Checks the model folder that load(params) would read, without loading it
+// and without ending the process: the list file (present, at least one stage,
+// each line a folder and a threshold ending in a newline), each stage and the
+// calibration net (description and weights present and parsing, layers of
+// kinds a detection net runs, weights of the shapes the description gives, a
+// mean of the input's size, a calibration table the net's classes cover).
+// Gives STATUS_OK and an empty message, or STATUS_MODEL_LOAD_FAILED and a
+// message "path: what" naming the first fault. Descriptions of the old
+// generation are refused (convert them with upgrade_net_proto_text).
+// A description whose layers parse but do not fit each other (a kernel larger
+// than its input, say) still ends the process, as a load would.
+TAVI_EXPORT Status checkDetectorModel(const DetectorParams& params, std::string& message);
+
 // Scan settings for detect, chosen for one loaded detector and one image size.
 struct ScanSettings {
   CascadeParameter params;
@@ -171,6 +184,12 @@ TAVI_EXPORT Status scanSettingsFor(const Detector& detector, int32_t width, int3
 // model loaded before (which is dropped even if this load then fails).
 // REQUIRES: no alignment runs during the call.
 TAVI_EXPORT Status loadSDMModel(const std::string& folder, const std::string& file);
+// Checks the alignment model file folder + "/" + file as loadSDMModel would
+// read it, without loading it: a complete file of a 68-point model whose
+// stage maps, levels and settings alignment can use. Gives STATUS_OK and an
+// empty message, or STATUS_MODEL_LOAD_FAILED and a message "path: what".
+TAVI_EXPORT Status checkSDMModel(const std::string& folder, const std::string& file,
+                                 std::string& message);
 // Releases the alignment model; STATUS_OK also when none is loaded.
 // REQUIRES: no alignment runs during the call.
 TAVI_EXPORT Status unloadSDMModel();

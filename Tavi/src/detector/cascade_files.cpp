@@ -5,6 +5,8 @@
 
 namespace tavilib {
 
+const char kCalibrationFolder[] = "cascades/x32Net-x32-3Scales-200/";
+
 std::vector<CascadeListEntry> readCascadeList(const std::string& path) {
   std::vector<CascadeListEntry> entries;
   std::ifstream list(path);

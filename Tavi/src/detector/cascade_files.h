@@ -8,6 +8,10 @@
 
 namespace tavilib {
 
+// The calibration net's folder below a model folder; a list file can't name
+// another.
+extern const char kCalibrationFolder[];
+
 // One stage line of a cascade list file.
 struct CascadeListEntry {
   std::string folder;

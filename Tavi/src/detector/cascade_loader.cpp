@@ -19,9 +19,6 @@ namespace {
 // Serialises the building of nets across all loads of the process.
 boost::mutex loadMutex;
 
-// Fixed in the library: a list file can't name another calibration folder.
-const char kCalibrationFolder[] = "cascades/x32Net-x32-3Scales-200/";
-
 using NetPointer = boost::shared_ptr<nn::Net<float>>;
 
 // The net that runs over the whole image: primed, and its first layer must

@@ -45,6 +45,9 @@ TEST(ExportedSymbolsTest, OnlyTheTavilibInterfaceLeavesTheLibrary) {
                                        "char const* const&)"));
   EXPECT_THAT(names, testing::Contains("tavilib::scanSettingsFor(tavilib::Detector const&, int, int, "
                                        "int, tavilib::ScanSettings&)"));
+  EXPECT_THAT(names, testing::Contains(testing::StartsWith(
+                         "tavilib::checkDetectorModel(tavilib::DetectorParams const&, std::")));
+  EXPECT_THAT(names, testing::Contains(testing::StartsWith("tavilib::checkSDMModel(std::")));
   EXPECT_THAT(names, testing::Contains(testing::StartsWith("tavilib::loadSDMModel(std::")));
   EXPECT_THAT(names, testing::Contains("tavilib::unloadSDMModel()"));
   EXPECT_THAT(names, testing::Contains(testing::StartsWith(

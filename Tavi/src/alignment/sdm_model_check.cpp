@@ -1,0 +1,135 @@
+#include "alignment/sdm_model_check.h"
+
+#include <cmath>
+#include <cstdint>
+#include <cstring>
+#include <filesystem>
+#include <fstream>
+#include <iterator>
+#include <vector>
+
+#include "tavilib.h"
+
+namespace SDMCore {
+
+namespace {
+
+constexpr int64_t kPoints = 68;
+constexpr int64_t kDescriptorLength = 128;
+
+// Reads the file's sections in order; a read past the end marks it short.
+class LayoutWalk {
+ public:
+  explicit LayoutWalk(std::string bytes) : bytes_(std::move(bytes)) {}
+
+  bool shortOfBytes() const { return short_; }
+  size_t left() const { return bytes_.size() - at_; }
+
+  int32_t int32() { return take<int32_t>(); }
+
+  // A matrix record's dimensions; its elements are skipped. Negative
+  // dimensions count as short.
+  void matrix(int64_t& rows, int64_t& columns) {
+    rows = take<int64_t>();
+    columns = take<int64_t>();
+    if (rows < 0 || columns < 0 || (columns > 0 && rows > static_cast<int64_t>(left()) / 4 / columns)) {
+      short_ = true;
+      return;
+    }
+    at_ += static_cast<size_t>(rows * columns * 4);
+  }
+
+  // A list of count 4-byte values.
+  template <typename Value>
+  std::vector<Value> values(int32_t count) {
+    if (count < 0 || static_cast<size_t>(count) > left() / 4) {
+      short_ = true;
+      return {};
+    }
+    std::vector<Value> values(static_cast<size_t>(count));
+    std::memcpy(values.data(), bytes_.data() + at_, values.size() * 4);
+    at_ += values.size() * 4;
+    return values;
+  }
+
+ private:
+  template <typename Value>
+  Value take() {
+    Value value{};
+    if (short_ || left() < sizeof value) {
+      short_ = true;
+      return value;
+    }
+    std::memcpy(&value, bytes_.data() + at_, sizeof value);
+    at_ += sizeof value;
+    return value;
+  }
+
+  std::string bytes_;
+  size_t at_ = 0;
+  bool short_ = false;
+};
+
+std::string layoutFault(LayoutWalk& walk) {
+  int64_t rows = 0;
+  int64_t columns = 0;
+  for (int section = 0; section < 2; ++section) {  // stage matrices, stage biases
+    const int32_t count = walk.int32();
+    for (int32_t i = 0; i < count && !walk.shortOfBytes(); ++i) walk.matrix(rows, columns);
+  }
+  const std::vector<float> meanShape = walk.values<float>(walk.int32());
+  walk.values<float>(walk.int32());
+  if (walk.shortOfBytes()) return "cut short before its stages";
+  if (static_cast<int64_t>(meanShape.size()) != 2 * kPoints) return "the mean shape needs 68 points";
+  for (float value : meanShape) {
+    if (!std::isfinite(value)) return "the mean shape holds a value that is not finite";
+  }
+  const int32_t stages = walk.int32();
+  if (stages < 1) return "no stage";
+  for (int32_t i = 0; i < stages && !walk.shortOfBytes(); ++i) {
+    walk.matrix(rows, columns);
+    const bool meanFits = rows == 1 && columns == kPoints * kDescriptorLength;
+    walk.matrix(rows, columns);
+    if (!walk.shortOfBytes() &&
+        !(meanFits && rows == kPoints * kDescriptorLength && columns == 2 * kPoints)) {
+      return "stage " + std::to_string(i + 1) + " needs a 1 by 8704 mean and an 8704 by 136 map";
+    }
+  }
+  const std::vector<int32_t> levels = walk.values<int32_t>(walk.int32());
+  walk.int32();  // not used
+  walk.int32();  // model flag
+  const int32_t scalesPerOctave = walk.int32();
+  const int32_t faceWidth = walk.int32();
+  if (walk.shortOfBytes()) return "cut short";
+  if (walk.left() != 0) return std::to_string(walk.left()) + " bytes after the model";
+  if (scalesPerOctave < 1 || scalesPerOctave > 16) return "scales per octave must be 1 to 16";
+  if (faceWidth < 8 || faceWidth > 4096) return "the face width must be 8 to 4096 pixels";
+  for (int32_t level : levels) {
+    if (level < 0 || level > scalesPerOctave + 2) {
+      return "a stage level outside 0 to " + std::to_string(scalesPerOctave + 2);
+    }
+  }
+  return {};
+}
+
+}  // namespace
+
+std::string sdmFileFault(const std::string& path) {
+  std::error_code error;
+  if (!std::filesystem::is_regular_file(path, error)) return path + ": missing or not a file";
+  std::ifstream file(path, std::ios::binary);
+  LayoutWalk walk(std::string((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>()));
+  const std::string fault = layoutFault(walk);
+  return fault.empty() ? fault : path + ": " + fault;
+}
+
+}  // namespace SDMCore
+
+namespace tavilib {
+
+Status checkSDMModel(const std::string& folder, const std::string& file, std::string& message) {
+  message = SDMCore::sdmFileFault(folder + "/" + file);
+  return message.empty() ? STATUS_OK : STATUS_MODEL_LOAD_FAILED;
+}
+
+}  // namespace tavilib
