@@ -33,7 +33,7 @@ constexpr int kCalibrationWindowsPerFace = 3;
 
 enum class Role { kScan, kGrader, kCalibration };
 
-struct StageSpec {
+struct StagePlan {
   const char* folder;
   const char* text;
   Role role;
@@ -47,7 +47,7 @@ struct StageSpec {
   StageRecipe recipe;
 };
 
-std::vector<StageSpec> cascadeStages() {
+std::vector<StagePlan> cascadeStages() {
   NetTrainingSettings scan;
   scan.batch = 128;
   scan.baseLr = 0.02f;
@@ -104,7 +104,7 @@ DetectorData thin(DetectorData data, int shrink) {
   return data;
 }
 
-nn::NetParameter deployDescription(const StageSpec& stage) {
+nn::NetParameter deployDescription(const StagePlan& stage) {
   nn::NetParameter description;
   nn::ReadNetParamsFromText(stage.text, &description);
   if (stage.role == Role::kScan) {
@@ -114,7 +114,7 @@ nn::NetParameter deployDescription(const StageSpec& stage) {
   return description;
 }
 
-WindowSet windowsOfEpoch(const DetectorData& data, const StageSpec& stage, unsigned seed) {
+WindowSet windowsOfEpoch(const DetectorData& data, const StagePlan& stage, unsigned seed) {
   WindowSampler sampler(stage.recipe.side, seed);
   if (stage.role == Role::kCalibration) {
     return drawCalibrationWindows(data, kCalibrationWindowsPerFace, calibrationTable(), sampler);
@@ -124,7 +124,7 @@ WindowSet windowsOfEpoch(const DetectorData& data, const StageSpec& stage, unsig
 
 // Pass rates at the stage's decision point (two-class nets) or the share of
 // right classes (calibration).
-void printValidation(NetTrainer& trainer, const WindowSet& validation, const StageSpec& stage) {
+void printValidation(NetTrainer& trainer, const WindowSet& validation, const StagePlan& stage) {
   const std::vector<std::vector<float>> probabilities = trainer.probabilities(validation);
   size_t passed[2] = {0, 0};
   size_t right = 0;
@@ -152,7 +152,7 @@ void printValidation(NetTrainer& trainer, const WindowSet& validation, const Sta
   std::fflush(stdout);
 }
 
-void addToCascade(tavilib::DetectorState& soFar, const StageSpec& stage,
+void addToCascade(tavilib::DetectorState& soFar, const StagePlan& stage,
                   const std::string& folder) {
   switch (stage.role) {
     case Role::kScan:
@@ -170,7 +170,7 @@ void addToCascade(tavilib::DetectorState& soFar, const StageSpec& stage,
   }
 }
 
-void trainStage(const StageSpec& stage, unsigned stageSeed, const DetectorData& train,
+void trainStage(const StagePlan& stage, unsigned stageSeed, const DetectorData& train,
                 const DetectorData& validation, std::vector<tavilib::DetectorState>& soFar,
                 const std::string& folder, const std::string& snapshots, int shrink,
                 int threads) {
@@ -235,9 +235,9 @@ void trainStage(const StageSpec& stage, unsigned stageSeed, const DetectorData& 
   std::printf("  written to %s (%.0f s)\n", folder.c_str(), secondsSince(start));
 }
 
-std::string listFileText(const std::vector<StageSpec>& stages) {
+std::string listFileText(const std::vector<StagePlan>& stages) {
   std::string text = "# The trained cascade: scan, 24-pixel grader, 48-pixel grader.\n";
-  for (const StageSpec& stage : stages) {
+  for (const StagePlan& stage : stages) {
     if (stage.role != Role::kCalibration) {
       char threshold[32];
       std::snprintf(threshold, sizeof threshold, "%g", static_cast<double>(stage.threshold));
@@ -260,11 +260,11 @@ void trainCascade(const CascadeTrainingOptions& options) {
               train.faces.size(), train.crops.size(), train.negatives.size(),
               validation.faces.size(), validation.negatives.size(), secondsSince(start));
 
-  const std::vector<StageSpec> stages = cascadeStages();
+  const std::vector<StagePlan> stages = cascadeStages();
   // The cascade so far, once for each worker of the mining.
   std::vector<tavilib::DetectorState> soFar(static_cast<size_t>(options.threads));
   for (size_t s = 0; s < stages.size(); ++s) {
-    const StageSpec& stage = stages[s];
+    const StagePlan& stage = stages[s];
     const std::string folder = options.workFolder + "/model/" + stage.folder;
     std::printf("stage %zu of %zu: %s\n", s + 1, stages.size(), stage.folder);
     std::fflush(stdout);
@@ -280,7 +280,7 @@ void trainCascade(const CascadeTrainingOptions& options) {
     }
   }
 
-  for (const StageSpec& stage : stages) {
+  for (const StagePlan& stage : stages) {
     copyStageFolder(options.workFolder + "/model/" + stage.folder,
                     options.outputRoot + stage.folder);
   }
