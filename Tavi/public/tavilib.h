@@ -142,9 +142,14 @@ TAVI_EXPORT void unloadDetector(Detector& detector);
 // vector held before stays in front. A detector that is not loaded, or whose
 // last load failed, gives STATUS_DETECTOR_NOT_READY and leaves detections as
 // they were.
-// REQUIRES: params make the base image fit the first network's declared input
-//   (384 by 384 with the built-in load, 640 by 640 from the shipped folder);
-//   scanSettingsFor gives such settings.
+// REQUIRES: image.data holds image.height rows of image.stride bytes (of
+//   width * 3 when stride is 0), each starting with width pixels.
+// REQUIRES: params have normalizedSize, windowSize, minFaceRatio and maxUpscale
+//   above 0, a finite scaleStep above 1, and give a base image within the first
+//   network's declared input (384 by 384 with the built-in load, 640 by 640
+//   from the shipped folder); scanSettingsFor gives such settings. Otherwise
+//   detect throws std::invalid_argument, as for a negative stride or one below
+//   width * 3, and leaves detections as they were.
 // REQUIRES: no other thread uses the same Detector during the call.
 TAVI_EXPORT Status detect(const Image& image, const Detector& detector,
                           std::vector<Detection>& detections, const CascadeParameter& params);
@@ -182,6 +187,9 @@ TAVI_EXPORT Status scanSettingsFor(const Detector& detector, int32_t width, int3
 
 // Loads the alignment model from the file folder + "/" + file, replacing any
 // model loaded before (which is dropped even if this load then fails).
+// A file whose sizes would take the alignment outside its arrays (stage maps
+// that do not fit the mean shape, levels beyond the descriptor pyramid,
+// settings out of range) or that ends early is refused like a missing one.
 // REQUIRES: no alignment runs during the call.
 TAVI_EXPORT Status loadSDMModel(const std::string& folder, const std::string& file);
 // Checks the alignment model file folder + "/" + file as loadSDMModel would
@@ -196,7 +204,11 @@ TAVI_EXPORT Status unloadSDMModel();
 // Replaces the contents of points by 68 landmarks as 136 floats, interleaved
 // x and y, in pixels of image. Without a loaded 68-point model (none loaded,
 // or the last load failed) gives STATUS_MODEL_LOAD_FAILED and no points.
-// REQUIRES: image rows are tightly packed (stride is ignored).
+// REQUIRES: image rows are tightly packed (stride is ignored): image.data
+//   holds width * height * 3 bytes.
+// REQUIRES: image has pixels and rect is finite and leaves some of them in
+//   its crop; otherwise std::invalid_argument is thrown (a rectangle wholly
+//   outside the image raises the image library's exception).
 TAVI_EXPORT Status align68Points(const Image& image, const Rectangle<float>& rect,
                                  std::vector<float>& points);
 // Replaces the contents of points by five landmarks as 10 floats: the centres

@@ -2,11 +2,13 @@
 // a face in its working frame, and the five points.
 #include <opencv2/core.hpp>
 
+#include <stdexcept>
 #include <string>
 #include <vector>
 
 #include "alignment/alignment_frame.h"
 #include "alignment/sdm_model.h"
+#include "alignment/sdm_model_check.h"
 #include "alignment/sdm_regression.h"
 #include "tavilib.h"
 
@@ -30,6 +32,11 @@ Status loadSDMModel(const std::string& folder, const std::string& file) {
   }
   SDMCore::sdmModel = new SDMCore::SDMModel();
   const std::string path = folder + "/" + file;
+  // A file whose sizes would take alignment outside its arrays is refused
+  // like a missing one.
+  if (!SDMCore::sdmFileFault(path, SDMCore::SDMCheck::kSafeToLoad).empty()) {
+    return STATUS_MODEL_LOAD_FAILED;
+  }
   return SDMCore::readSDMModel(path, *SDMCore::sdmModel) ? STATUS_OK : STATUS_MODEL_LOAD_FAILED;
 }
 
@@ -47,6 +54,9 @@ Status align68Points(const Image& image, const Rectangle<float>& rect, std::vect
       SDMCore::sdmModel->meanShape.size() != 2 * static_cast<size_t>(kLandmarkCount)) {
     points.clear();
     return STATUS_MODEL_LOAD_FAILED;
+  }
+  if (image.width < 1 || image.height < 1 || image.data == nullptr) {
+    throw std::invalid_argument("align68Points: an empty image");
   }
   // Rows are taken as tightly packed; stride is not read.
   const cv::Mat pixels(image.height, image.width, CV_8UC3, image.data,

@@ -5,6 +5,7 @@
 #include <opencv2/imgproc.hpp>
 
 #include <algorithm>
+#include <stdexcept>
 
 #include "alignment/resize_antialias.h"
 
@@ -13,6 +14,16 @@ namespace tavilib {
 namespace {
 
 constexpr int kFrameSize = 250;
+
+// value truncated toward zero. A value no int holds comes only from a
+// rectangle that is not finite or lies absurdly far out, and is refused
+// rather than cast.
+int truncatedInt(double value) {
+  if (!(value >= -2147483648.0 && value < 2147483648.0)) {
+    throw std::invalid_argument("align68Points: the rectangle is not finite or lies too far out");
+  }
+  return static_cast<int>(value);
+}
 
 }  // namespace
 
@@ -41,9 +52,13 @@ AlignmentFrame makeAlignmentFrame(const cv::Mat& image, const Rectangle<float>& 
     if (!(static_cast<float>(image.rows) > regionBottom)) {
       regionBottom = static_cast<float>(image.rows - 1);
     }
-    const cv::Rect region(static_cast<int>(cropX), static_cast<int>(cropY),
-                          static_cast<int>(regionRight - cropX),
-                          static_cast<int>(regionBottom - cropY));
+    const cv::Rect region(truncatedInt(cropX), truncatedInt(cropY),
+                          truncatedInt(regionRight - cropX), truncatedInt(regionBottom - cropY));
+    // A negative size is the image library's to refuse; an empty one would
+    // leave nothing to scale.
+    if (region.width == 0 || region.height == 0) {
+      throw std::invalid_argument("align68Points: the rectangle leaves no pixels of the image");
+    }
     work = work(region);
     left -= cropX;
     right -= cropX;
@@ -78,10 +93,10 @@ AlignmentFrame makeAlignmentFrame(const cv::Mat& image, const Rectangle<float>& 
     boxX = static_cast<int>((columns - boxW) * 0.5);
     boxY = static_cast<int>((rows - boxH) * 0.5);
   } else {
-    boxX = static_cast<int>(left);
-    boxY = static_cast<int>(top);
-    boxW = static_cast<int>(right - left);
-    boxH = static_cast<int>(bottom - top);
+    boxX = truncatedInt(left);
+    boxY = truncatedInt(top);
+    boxW = truncatedInt(right - left);
+    boxH = truncatedInt(bottom - top);
   }
 
   // Enlarged asymmetrically: a fifth wider but moved left by a twentieth of
@@ -89,10 +104,14 @@ AlignmentFrame makeAlignmentFrame(const cv::Mat& image, const Rectangle<float>& 
   const float a = static_cast<float>(boxW) * 0.1f;
   const float b = static_cast<float>(boxH) * 0.15f;
   AlignmentFrame frame;
-  frame.faceRect.x = static_cast<int>(static_cast<double>(boxX) - static_cast<double>(a) * 0.5);
-  frame.faceRect.y = static_cast<int>(static_cast<float>(boxY) + b);
-  frame.faceRect.width = static_cast<int>(a + a + static_cast<float>(boxW));
-  frame.faceRect.height = static_cast<int>(b + b + static_cast<float>(boxH));
+  frame.faceRect.x = truncatedInt(static_cast<double>(boxX) - static_cast<double>(a) * 0.5);
+  frame.faceRect.y = truncatedInt(static_cast<float>(boxY) + b);
+  frame.faceRect.width = truncatedInt(a + a + static_cast<float>(boxW));
+  frame.faceRect.height = truncatedInt(b + b + static_cast<float>(boxH));
+  // The face is normalised to a width by dividing by this one.
+  if (frame.faceRect.width < 1 || frame.faceRect.height < 1) {
+    throw std::invalid_argument("align68Points: the rectangle is too small to align");
+  }
   // Code 7 (COLOR_RGB2GRAY) weighs the first byte as red, although it holds
   // blue; the models are trained with this.
   cv::cvtColor(work, frame.grey, cv::COLOR_RGB2GRAY, 0);

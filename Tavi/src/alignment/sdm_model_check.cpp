@@ -70,7 +70,8 @@ class LayoutWalk {
   bool short_ = false;
 };
 
-std::string layoutFault(LayoutWalk& walk) {
+std::string layoutFault(LayoutWalk& walk, SDMCheck check) {
+  const bool for68 = check == SDMCheck::kUsableFor68Points;
   int64_t rows = 0;
   int64_t columns = 0;
   for (int section = 0; section < 2; ++section) {  // stage matrices, stage biases
@@ -80,19 +81,22 @@ std::string layoutFault(LayoutWalk& walk) {
   const std::vector<float> meanShape = walk.values<float>(walk.int32());
   walk.values<float>(walk.int32());
   if (walk.shortOfBytes()) return "cut short before its stages";
-  if (static_cast<int64_t>(meanShape.size()) != 2 * kPoints) return "the mean shape needs 68 points";
+  const int64_t points = static_cast<int64_t>(meanShape.size()) / 2;
+  if (meanShape.size() % 2 != 0) return "the mean shape has an odd length";
+  if (for68 && points != kPoints) return "the mean shape needs 68 points";
   for (float value : meanShape) {
     if (!std::isfinite(value)) return "the mean shape holds a value that is not finite";
   }
   const int32_t stages = walk.int32();
-  if (stages < 1) return "no stage";
+  if (for68 && stages < 1) return "no stage";
+  const int64_t features = points * kDescriptorLength;
   for (int32_t i = 0; i < stages && !walk.shortOfBytes(); ++i) {
     walk.matrix(rows, columns);
-    const bool meanFits = rows == 1 && columns == kPoints * kDescriptorLength;
+    const bool meanFits = rows == 1 && columns == features;
     walk.matrix(rows, columns);
-    if (!walk.shortOfBytes() &&
-        !(meanFits && rows == kPoints * kDescriptorLength && columns == 2 * kPoints)) {
-      return "stage " + std::to_string(i + 1) + " needs a 1 by 8704 mean and an 8704 by 136 map";
+    if (!walk.shortOfBytes() && !(meanFits && rows == features && columns == 2 * points)) {
+      return "stage " + std::to_string(i + 1) + " needs a 1 by " + std::to_string(features) +
+             " mean and a " + std::to_string(features) + " by " + std::to_string(2 * points) + " map";
     }
   }
   const std::vector<int32_t> levels = walk.values<int32_t>(walk.int32());
@@ -101,7 +105,7 @@ std::string layoutFault(LayoutWalk& walk) {
   const int32_t scalesPerOctave = walk.int32();
   const int32_t faceWidth = walk.int32();
   if (walk.shortOfBytes()) return "cut short";
-  if (walk.left() != 0) return std::to_string(walk.left()) + " bytes after the model";
+  if (for68 && walk.left() != 0) return std::to_string(walk.left()) + " bytes after the model";
   if (scalesPerOctave < 1 || scalesPerOctave > 16) return "scales per octave must be 1 to 16";
   if (faceWidth < 8 || faceWidth > 4096) return "the face width must be 8 to 4096 pixels";
   for (int32_t level : levels) {
@@ -114,12 +118,12 @@ std::string layoutFault(LayoutWalk& walk) {
 
 }  // namespace
 
-std::string sdmFileFault(const std::string& path) {
+std::string sdmFileFault(const std::string& path, SDMCheck check) {
   std::error_code error;
   if (!std::filesystem::is_regular_file(path, error)) return path + ": missing or not a file";
   std::ifstream file(path, std::ios::binary);
   LayoutWalk walk(std::string((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>()));
-  const std::string fault = layoutFault(walk);
+  const std::string fault = layoutFault(walk, check);
   return fault.empty() ? fault : path + ": " + fault;
 }
 
@@ -128,7 +132,7 @@ std::string sdmFileFault(const std::string& path) {
 namespace tavilib {
 
 Status checkSDMModel(const std::string& folder, const std::string& file, std::string& message) {
-  message = SDMCore::sdmFileFault(folder + "/" + file);
+  message = SDMCore::sdmFileFault(folder + "/" + file, SDMCore::SDMCheck::kUsableFor68Points);
   return message.empty() ? STATUS_OK : STATUS_MODEL_LOAD_FAILED;
 }
 

@@ -5,11 +5,19 @@
 
 namespace SDMCore {
 
-// The first fault of the landmark model file at path that would make the
-// reader fail or the alignment read or write outside its arrays, as
-// "path: what"; empty for a sound file. Walks the layout without allocating
-// what its counts claim, so a corrupt count costs nothing.
-std::string sdmFileFault(const std::string& path);
+enum class SDMCheck {
+  // Complete up to its last setting, with stage maps that fit the mean
+  // shape, levels the pyramid has and settings in range: alignment stays
+  // inside its arrays.
+  kSafeToLoad,
+  // That, of 68 points, with at least one stage and nothing behind it.
+  kUsableFor68Points,
+};
+
+// The first fault of the landmark model file at path, as "path: what";
+// empty for a sound file. Walks the layout without allocating what its
+// counts claim, so a corrupt count costs nothing.
+std::string sdmFileFault(const std::string& path, SDMCheck check);
 
 }  // namespace SDMCore
 

@@ -4,10 +4,15 @@
 #include <cmath>
 #include <cstring>
 
-#if defined(__SSE2__)
+// TAVI_PORTABLE builds the plain roads only; they give the same numbers.
+#if defined(__SSE2__) && !defined(TAVI_PORTABLE)
+#define TAVI_SSE2_ROADS 1
 #include <emmintrin.h>
 #include <immintrin.h>
 #include <xmmintrin.h>
+#endif
+#if defined(TAVI_SSE2_ROADS) && (defined(__x86_64__) || defined(__i386__))
+#define TAVI_AVX2_ROADS 1
 #endif
 
 namespace SDMCore {
@@ -32,7 +37,7 @@ float powerBySquaring(float base, int e) {
 constexpr int kPaddedSide = 6;
 constexpr int kPaddedBins = kPaddedSide * kPaddedSide * 8;
 
-#if defined(__SSE2__)
+#if defined(TAVI_SSE2_ROADS)
 // mask ? a : b, lane by lane.
 inline __m128 select(__m128 mask, __m128 a, __m128 b) {
   return _mm_or_ps(_mm_and_ps(mask, a), _mm_andnot_ps(mask, b));
@@ -50,11 +55,13 @@ float sumOfSquares(const float* h) {
   return (s[0] + s[1]) + (s[2] + s[3]);
 }
 
+#if defined(TAVI_SSE2_ROADS)
 // The unit vectors of the eight bins.
 alignas(32) const float kUnit[8][8] = {
     {1, 0, 0, 0, 0, 0, 0, 0}, {0, 1, 0, 0, 0, 0, 0, 0}, {0, 0, 1, 0, 0, 0, 0, 0},
     {0, 0, 0, 1, 0, 0, 0, 0}, {0, 0, 0, 0, 1, 0, 0, 0}, {0, 0, 0, 0, 0, 1, 0, 0},
     {0, 0, 0, 0, 0, 0, 1, 0}, {0, 0, 0, 0, 0, 0, 0, 1}};
+#endif
 
 // One row of samples into the histogram rows top (row0) and top + 48
 // (row0 + 1). Each sample adds w * (1 - tx) * (1 - ty) and so on to the main
@@ -63,7 +70,7 @@ alignas(32) const float kUnit[8][8] = {
 void accumulateRow(const SiftPyramid::SampleCell* line, const int64_t* dxs, const int* colBase,
                    const float* across, size_t columns, float uy, float ty, float* top) {
   float* bottom = top + kPaddedSide * 8;
-#if defined(__SSE2__)
+#if defined(TAVI_SSE2_ROADS)
   // The four cells of the current column pair stay in registers while col0
   // stays the same. A sample's contribution to a cell is the cell's unit
   // vector of the main bin plus that of the second bin times the ratio, times
@@ -159,7 +166,8 @@ void accumulateRow(const SiftPyramid::SampleCell* line, const int64_t* dxs, cons
 #endif
 }
 
-#if defined(__x86_64__) || defined(__i386__)
+#if defined(TAVI_AVX2_ROADS)
+
 const bool kWideRowsAvailable = [] {
   __builtin_cpu_init();  // this runs among the static constructors
   return __builtin_cpu_supports("avx2") != 0;
@@ -219,14 +227,16 @@ __attribute__((target("avx2"))) void accumulateRowAvx(const SiftPyramid::SampleC
 
 #endif
 
+#if defined(TAVI_AVX2_ROADS)
 // Whether accumulateRowAvx may run: the processor has it and no test has
 // switched it off.
 bool wideRows = kWideRowsAvailable;
+#endif
 
 }  // namespace
 
 bool SiftPyramid::setWideHistogramRows(bool enabled) {
-#if defined(__x86_64__) || defined(__i386__)
+#if defined(TAVI_AVX2_ROADS)
   wideRows = enabled && kWideRowsAvailable;
   return wideRows;
 #else
@@ -339,7 +349,7 @@ namespace {
 void weightedSum(const float* const* rows, const float* kernel, size_t size, size_t width,
                  float* out) {
   size_t i = 0;
-#if defined(__SSE2__)
+#if defined(TAVI_SSE2_ROADS)
   for (; i + 16 <= width; i += 16) {
     __m128 a0 = _mm_setzero_ps(), a1 = a0, a2 = a0, a3 = a0;
     for (size_t j = 0; j < size; ++j) {
@@ -469,7 +479,7 @@ void SiftPyramid::ensureGradient(int level) {
     const float* below = image.row(y + 1);
     SampleCell* out = cells.data() + y * w;
     uint64_t x = 1;
-#if defined(__SSE2__)
+#if defined(TAVI_SSE2_ROADS)
     // Four pixels at a time, every branch of the scalar road computed and the
     // lane's own selected: the same operations on the same values.
     const __m128 zero = _mm_setzero_ps();
@@ -595,7 +605,7 @@ void SiftPyramid::computeDescriptor(float x, float y, float level, float& norm, 
     const float uy = 1.0f - ty;
     float* top = padded + (static_cast<int>(row0) + 3) * kPaddedSide * 8;
     const SampleCell* line = cells.data() + (yi + dy) * w + xi;
-#if defined(__x86_64__) || defined(__i386__)
+#if defined(TAVI_AVX2_ROADS)
     if (wideRows) {
       accumulateRowAvx(line, dxs.data(), colBase.data(), across.data(), columns, uy, ty, top);
       continue;

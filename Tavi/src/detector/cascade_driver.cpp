@@ -1,5 +1,7 @@
 #include "detector/cascade_driver.h"
 
+#include <cstdint>
+#include <stdexcept>
 #include <utility>
 
 #include "detector/window_filter.h"
@@ -9,6 +11,10 @@ namespace tavilib {
 namespace {
 
 cv::Mat wrapImage(const Image& image) {
+  if (image.stride < 0 ||
+      (image.stride > 0 && image.stride < static_cast<int64_t>(image.width) * 3)) {
+    throw std::invalid_argument("detect: the stride must be 0 or at least width * 3 bytes");
+  }
   // A stride of 0 is cv::Mat::AUTO_STEP: tightly packed rows.
   return cv::Mat(image.height, image.width, CV_8UC3, image.data,
                  static_cast<size_t>(image.stride));

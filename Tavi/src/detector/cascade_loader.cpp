@@ -30,10 +30,18 @@ void primeFirstNet(nn::Net<float>& net) {
   firstLayer->CheckBinarization();
 }
 
+// An empty description (or a folder read as one) builds a net without input
+// or output, which every later step would dereference.
+void requireInputAndProbs(const nn::Net<float>& net, const std::string& description) {
+  CHECK(!net.net_input_blobs().empty() && net.output_blob())
+      << "Net description " << description << " has no input or no \"probs\" blob.";
+}
+
 CascadeStage loadBuiltInStage(const std::string& text, const std::string& weights,
                               const std::vector<double>& mean) {
   CascadeStage stage;
   stage.net.reset(new nn::Net<float>(text, nn::NetDescription::kText));
+  requireInputAndProbs(*stage.net, "of the built-in cascade");
   stage.net->CopyTrainedLayersFrom(weights);
   stage.mean.assign(mean.begin(), mean.end());
   return stage;
@@ -44,6 +52,7 @@ CascadeStage loadBuiltInStage(const std::string& text, const std::string& weight
 CascadeStage loadFullStage(const std::string& folder) {
   CascadeStage stage;
   stage.net.reset(new nn::Net<float>(folder + "/prototxt-full", nn::NetDescription::kFile));
+  requireInputAndProbs(*stage.net, folder + "/prototxt-full");
   stage.net->CopyTrainedLayersFrom(folder + "/proto-full");
   primeFirstNet(*stage.net);
   return stage;
@@ -52,6 +61,7 @@ CascadeStage loadFullStage(const std::string& folder) {
 CascadeStage loadDeployStage(const std::string& folder) {
   CascadeStage stage;
   stage.net.reset(new nn::Net<float>(folder + "/prototxt-deploy", nn::NetDescription::kFile));
+  requireInputAndProbs(*stage.net, folder + "/prototxt-deploy");
   stage.net->CopyTrainedLayersFrom(folder + "/proto");
   stage.mean = readMeanFile(folder + "/mean");
   return stage;

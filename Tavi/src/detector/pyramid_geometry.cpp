@@ -2,11 +2,32 @@
 
 #include <algorithm>
 #include <cmath>
+#include <stdexcept>
 
 namespace tavilib {
 
+namespace {
+
+// value truncated toward zero, refusing settings that would give a value no
+// int32_t holds.
+int32_t truncated(float value) {
+  if (!(value >= -2147483648.0f && value < 2147483648.0f)) {
+    throw std::invalid_argument("detect: scan settings that give no usable base image");
+  }
+  return static_cast<int32_t>(value);
+}
+
+}  // namespace
+
 PyramidGeometry computePyramidGeometry(int32_t columns, int32_t rows,
                                        const CascadeParameter& params) {
+  if (params.normalizedSize < 1 || params.windowSize < 1 || !(params.minFaceRatio > 0.0f) ||
+      !(params.maxUpscale > 0.0f) || !(params.scaleStep > 1.0f) ||
+      !std::isfinite(params.scaleStep)) {
+    throw std::invalid_argument(
+        "detect: scan settings need normalizedSize, windowSize, minFaceRatio and maxUpscale above "
+        "0 and a finite scaleStep above 1");
+  }
   PyramidGeometry geometry;
   const int32_t longEdge = std::max(rows, columns);
   geometry.ratio = static_cast<float>(params.normalizedSize) / static_cast<float>(longEdge);
@@ -14,12 +35,14 @@ PyramidGeometry computePyramidGeometry(int32_t columns, int32_t rows,
   if (longEdge <= params.normalizedSize && !(params.maxUpscale > geometry.ratio)) {
     geometry.ratio = params.maxUpscale;
   }
-  geometry.minimumFace =
-      static_cast<int32_t>(static_cast<float>(params.normalizedSize) * params.minFaceRatio);
+  geometry.minimumFace = truncated(static_cast<float>(params.normalizedSize) * params.minFaceRatio);
+  if (geometry.minimumFace < 1) {
+    throw std::invalid_argument("detect: scan settings whose minimum face is below one pixel");
+  }
   geometry.baseScale = static_cast<float>(params.windowSize) /
                        static_cast<float>(geometry.minimumFace) * geometry.ratio;
-  geometry.baseWidth = static_cast<int32_t>(static_cast<float>(columns) * geometry.baseScale);
-  geometry.baseHeight = static_cast<int32_t>(static_cast<float>(rows) * geometry.baseScale);
+  geometry.baseWidth = truncated(static_cast<float>(columns) * geometry.baseScale);
+  geometry.baseHeight = truncated(static_cast<float>(rows) * geometry.baseScale);
   return geometry;
 }
 

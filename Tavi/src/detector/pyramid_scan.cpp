@@ -2,6 +2,9 @@
 
 #include <opencv2/imgproc.hpp>
 
+#include <stdexcept>
+#include <string>
+
 #include "detector/image_planes.h"
 #include "detector/pyramid_geometry.h"
 #include "nn/net.h"
@@ -46,12 +49,22 @@ void appendLevelWindows(const nn::Blob<float>& probs, int32_t levelWidth, int32_
 PyramidScan scanPyramid(const cv::Mat& image, const CascadeParameter& params,
                         CascadeStage& firstStage) {
   const PyramidGeometry geometry = computePyramidGeometry(image.cols, image.rows, params);
+  nn::Net<float>& net = *firstStage.net;
+  // A larger base image would overrun the scan net's buffers.
+  if (geometry.baseWidth > net.declared_input_width() ||
+      geometry.baseHeight > net.declared_input_height()) {
+    throw std::invalid_argument("detect: a base image of " + std::to_string(geometry.baseWidth) +
+                                " by " + std::to_string(geometry.baseHeight) +
+                                " exceeds the scan net's input of " +
+                                std::to_string(net.declared_input_width()) + " by " +
+                                std::to_string(net.declared_input_height()) +
+                                "; scanSettingsFor gives settings that fit");
+  }
   cv::Mat base;
   cv::resize(image, base, cv::Size(geometry.baseWidth, geometry.baseHeight), 0, 0,
              cv::INTER_LINEAR);
 
   PyramidScan scan{{}, geometry.baseScale};
-  nn::Net<float>& net = *firstStage.net;
   for (int32_t level = 0; level < params.numScales; ++level) {
     const float factor = levelFactor(params.scaleStep, level);
     cv::Mat levelImage = base;

@@ -3,6 +3,7 @@
 #include <opencv2/imgproc.hpp>
 
 #include <algorithm>
+#include <cstdint>
 
 #include "detector/image_planes.h"
 #include "nn/net.h"
@@ -14,6 +15,15 @@ namespace {
 
 // A class must claim at least this probability to move a window.
 constexpr float kCalibrationConfidence = 0.1f;
+
+// value truncated toward zero into result, if a 32-bit integer holds it.
+bool truncated(float value, int64_t& result) {
+  if (!(value >= -2147483648.0f && value < 2147483648.0f)) {
+    return false;
+  }
+  result = static_cast<int64_t>(value);
+  return true;
+}
 
 // Cuts the window out, resizes it to the net's input, subtracts the stage's
 // mean and runs the net.
@@ -73,23 +83,29 @@ std::vector<Window> calibrateWindows(std::vector<Window> windows, CascadeStage& 
     }
     const OffsetScale& correction = calibration.offsetsScales[best];
     // A negative offset moves the window right or down; a scale below 1
-    // enlarges it.
-    const int32_t x = window.x - static_cast<int32_t>(static_cast<float>(correction.offsetX) /
-                                                      inputWidth *
-                                                      static_cast<float>(window.width));
-    const int32_t y = window.y - static_cast<int32_t>(static_cast<float>(correction.offsetY) /
-                                                      inputHeight *
-                                                      static_cast<float>(window.height));
-    const int32_t width =
-        static_cast<int32_t>(static_cast<float>(window.width) / correction.scale);
-    const int32_t height =
-        static_cast<int32_t>(static_cast<float>(window.height) / correction.scale);
+    // enlarges it. Values are truncated as the detector always did; one
+    // that no 32-bit integer holds (a scale of 0, an offset near 2^31)
+    // cannot land inside the image, and the window stays.
+    int64_t shiftX = 0;
+    int64_t shiftY = 0;
+    int64_t width = 0;
+    int64_t height = 0;
+    if (!truncated(static_cast<float>(correction.offsetX) / inputWidth *
+                       static_cast<float>(window.width), shiftX) ||
+        !truncated(static_cast<float>(correction.offsetY) / inputHeight *
+                       static_cast<float>(window.height), shiftY) ||
+        !truncated(static_cast<float>(window.width) / correction.scale, width) ||
+        !truncated(static_cast<float>(window.height) / correction.scale, height)) {
+      continue;
+    }
+    const int64_t x = window.x - shiftX;
+    const int64_t y = window.y - shiftY;
     // Strictly inside, or not at all: there is no clipping.
     if (x >= 0 && y >= 0 && x < image.cols - width && y < image.rows - height) {
-      window.x = x;
-      window.y = y;
-      window.width = width;
-      window.height = height;
+      window.x = static_cast<int32_t>(x);
+      window.y = static_cast<int32_t>(y);
+      window.width = static_cast<int32_t>(width);
+      window.height = static_cast<int32_t>(height);
     }
   }
   return windows;

@@ -6,7 +6,8 @@
 #include <limits>
 #include <new>
 
-#if defined(__SSE__)
+#if defined(__SSE__) && !defined(TAVI_PORTABLE)
+#define TAVI_SSE_ROADS 1
 #include <xmmintrin.h>
 #endif
 
@@ -156,7 +157,7 @@ void matrix::fill(float value) {
   // Up to the first 16-byte boundary one at a time, then blocks of four, then
   // the rest.
   while (p < end && reinterpret_cast<uintptr_t>(p) % 16 != 0) *p++ = value;
-#if defined(__SSE__)
+#if defined(TAVI_SSE_ROADS)
   const __m128 block = _mm_set1_ps(value);
   for (; end - p >= 4; p += 4) _mm_store_ps(p, block);
 #else

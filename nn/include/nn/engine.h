@@ -4,6 +4,7 @@
 #include <boost/random/mersenne_twister.hpp>
 #include <boost/shared_ptr.hpp>
 
+#include <atomic>
 #include <cstdint>
 
 namespace nn {
@@ -11,9 +12,11 @@ namespace nn {
 // The engine's one global object: the device layers run on (always the CPU
 // here), whether nets are training or testing, and the random generator.
 //
-// Not synchronised: the instance and the generator are created on first use
-// without a lock, and draws must come from one thread at a time. Loading sets
-// mode and phase before any net is built; forward passes only read the mode.
+// The instance and the generator are created once, whichever threads ask
+// first; mode and phase may be set and read from any thread. Draws from the
+// generator must come from one thread at a time (nets are built under the
+// detector's load lock). Loading sets mode and phase before any net is built;
+// forward passes only read them.
 class Engine {
  public:
   enum Brew { CPU = 0, GPU = 1 };
@@ -48,8 +51,8 @@ class Engine {
   Engine() = default;
 
   boost::shared_ptr<RNG> rng_;
-  Brew mode_ = CPU;
-  Phase phase_ = TRAIN;
+  std::atomic<Brew> mode_{CPU};
+  std::atomic<Phase> phase_{TRAIN};
 
   static boost::shared_ptr<Engine> singleton_;
 };

@@ -4,6 +4,7 @@
 
 #include <cstdlib>
 #include <ctime>
+#include <mutex>
 
 namespace nn {
 
@@ -23,9 +24,8 @@ boost::mt19937& Engine::RNG::engine() { return generator_->engine(); }
 boost::shared_ptr<Engine> Engine::singleton_;
 
 Engine& Engine::Get() {
-  if (!singleton_) {
-    singleton_.reset(new Engine());
-  }
+  static std::once_flag created;
+  std::call_once(created, [] { singleton_.reset(new Engine()); });
   return *singleton_;
 }
 
@@ -38,10 +38,11 @@ int64_t Engine::SeedFor(int64_t pid, int64_t seconds) {
 
 boost::mt19937& Engine::rng_engine() {
   Engine& engine = Get();
-  if (!engine.rng_) {
+  static std::once_flag seeded;
+  std::call_once(seeded, [&engine] {
     const int64_t seed = SeedFor(getpid(), static_cast<int64_t>(std::time(nullptr)));
     engine.rng_.reset(new RNG(static_cast<unsigned int>(seed)));
-  }
+  });
   return engine.rng_->engine();
 }
 

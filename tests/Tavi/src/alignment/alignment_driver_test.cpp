@@ -2,7 +2,9 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <limits>
 #include <string>
+#include <stdexcept>
 #include <thread>
 #include <vector>
 
@@ -144,6 +146,36 @@ TEST_F(AlignmentDriverTest, RectangleWhollyOutsideOrInvertedRaisesTheImageLibrar
   std::vector<float> points;
   EXPECT_THROW(align68Points(image, Rectangle<float>{400, 400, 450, 450}, points), cv::Exception);
   EXPECT_THROW(align68Points(image, Rectangle<float>{100, 100, 60, 60}, points), cv::Exception);
+}
+
+// Models that would take alignment outside its arrays do not load; inputs
+// that would divide by zero or cast what no int holds are refused.
+TEST_F(AlignmentDriverTest, UnsafeModelsAndInputsAreRefused) {
+  std::vector<uint8_t> bytes = NoiseBytes(200, 200, 5);
+  const Image image{200, 200, 0, bytes.data()};
+  std::vector<float> points;
+  std::vector<ModelContents> unsafe(4, RandomStagesModel(1, 9));
+  unsafe[0].scalesPerOctave = -2;
+  unsafe[1].stageLevels = {9};
+  unsafe[2].stageMaps[0].projection = mp::matrix(68 * 128, 100);
+  unsafe[3].stageMaps[0].mean = mp::matrix(1, 60 * 128);
+  for (const ModelContents& model : unsafe) {
+    dir_.write("unsafe.bin", ModelBytes(model));
+    EXPECT_EQ(loadSDMModel(dir_.path(), "unsafe.bin"), STATUS_MODEL_LOAD_FAILED);
+    EXPECT_EQ(align68Points(image, Rectangle<float>{50, 50, 150, 150}, points), STATUS_MODEL_LOAD_FAILED);
+  }
+
+  Load(StageFreeModel());
+  const float nan = std::numeric_limits<float>::quiet_NaN();
+  const float inf = std::numeric_limits<float>::infinity();
+  for (const Rectangle<float>& rect : {Rectangle<float>{nan, 50, 150, 150},
+                                       Rectangle<float>{50, 50, inf, 150},
+                                       Rectangle<float>{-1e30f, -1e30f, 1e30f, 1e30f},
+                                       Rectangle<float>{80, 80, 80, 150}}) {
+    EXPECT_THROW(align68Points(image, rect, points), std::invalid_argument) << rect.left;
+  }
+  EXPECT_THROW(align68Points(Image{0, 0, 0, bytes.data()}, Rectangle<float>{0, 0, 10, 10}, points),
+               std::invalid_argument);
 }
 
 TEST_F(AlignmentDriverTest, FivePointsAreTheListedMeans) {

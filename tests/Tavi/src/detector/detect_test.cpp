@@ -1,6 +1,8 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <limits>
+#include <stdexcept>
 #include <vector>
 
 #include "test_cascade.h"
@@ -124,6 +126,32 @@ TEST_F(DetectTest, ImagesWithoutPixelsRaiseTheImageLibrarysException) {
   EXPECT_THROW(detect(Image{0, 30, 0, pixels.data}, detector_, detections, kParams),
                cv::Exception);
   EXPECT_EQ(detections.size(), 2u);
+}
+
+// Strides and scan settings a host can get wrong are refused before any
+// pixel is read or any buffer written.
+TEST_F(DetectTest, StridesAndScanSettingsOutsideTheContractAreRefused) {
+  Load("scan 0.5\n", 0);
+  cv::Mat pixels = ImageWithPatch(400, 300, cv::Rect(100, 100, 60, 60));
+  std::vector<Detection> detections(1);
+  for (int32_t stride : {-1200, 5, 1199}) {
+    EXPECT_THROW(detect(Image{400, 300, stride, pixels.data}, detector_, detections, kParams),
+                 std::invalid_argument) << stride;
+  }
+  const float nan = std::numeric_limits<float>::quiet_NaN();
+  const CascadeParameter wrong[] = {
+      {1.0f, 0, 0.125f, 3, 1.5f, 12},   {1.0f, 400, 0.0f, 3, 1.5f, 12},
+      {1.0f, 400, nan, 3, 1.5f, 12},    {1.0f, 400, 1e-9f, 3, 1.5f, 12},
+      {1.0f, 400, 1e30f, 3, 1.5f, 12},  {1.0f, 400, 0.125f, 3, nan, 12},
+      {1.0f, 400, 0.125f, 3, 1.0f, 12}, {1.0f, 400, 0.125f, 3, 1.5f, 0},
+      {0.0f, 400, 0.125f, 3, 1.5f, 12},
+      // A base image of 1200 by 900 against the scan net's 200 by 200.
+      {1.0f, 400, 0.01f, 3, 1.5f, 12}};
+  for (const CascadeParameter& params : wrong) {
+    EXPECT_THROW(detect(AsImage(pixels), detector_, detections, params), std::invalid_argument)
+        << params.normalizedSize << " " << params.minFaceRatio << " " << params.scaleStep;
+  }
+  EXPECT_EQ(detections.size(), 1u);
 }
 
 }  // namespace

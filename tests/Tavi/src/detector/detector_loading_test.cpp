@@ -2,6 +2,7 @@
 #include <unistd.h>
 
 #include <climits>
+#include <filesystem>
 #include <string>
 
 #include "detector/cascade_net_texts.h"
@@ -84,6 +85,20 @@ TEST(DetectorLoadingDeathTest, MissingNetFilesEndTheProcess) {
   noCalibration.writeList("scan 0.5\n");
   EXPECT_DEATH(detector.load(noCalibration.params()),
                "File not found: .*/cascades/x32Net-x32-3Scales-200//prototxt-deploy");
+
+  // An empty description, a folder in its place, or a list line cut by a NUL
+  // byte (naming the model folder itself) give a net without input.
+  folder.writeList("scan 0.5\n");
+  dir.write("cascades/x32Net-x32-3Scales-200/prototxt-deploy", "");
+  EXPECT_DEATH(detector.load(folder.params()),
+               "Net description .*/cascades/x32Net-x32-3Scales-200//prototxt-deploy has no input "
+               "or no \"probs\" blob.");
+  std::filesystem::create_directories(dir.path() + "/folder/prototxt-full");
+  folder.writeList("folder 0.5\n");
+  EXPECT_DEATH(detector.load(folder.params()),
+               "Net description .*/folder/prototxt-full has no input or no \"probs\" blob.");
+  folder.writeList(std::string("folder\0/scan 0.5\n", 17));
+  EXPECT_DEATH(detector.load(folder.params()), "Net description .*/folder");
 }
 
 // Runs a body with the working directory moved, and moves it back.

@@ -103,6 +103,20 @@ TEST(WindowGradingTest, CalibrationNeedsAClaimOfOneInTenWithinTheTable) {
   // The favoured class 4 lies beyond a table of four rows.
   CascadeStage shortTable = CalibrationStage(4, 4);
   EXPECT_EQ(calibrateWindows({At(100, 100, 48)}, shortTable, image)[0].x, 100);
+
+  // Corrections no integer holds (a scale of 0 or a tiny one, offsets near
+  // 2^31) cannot land inside the image: the window stays, whole.
+  for (const OffsetScale& wild : {OffsetScale{0, 0, 0.0f}, OffsetScale{0, 0, 1e-30f},
+                                  OffsetScale{2000000000, 0, 1.0f},
+                                  OffsetScale{0, -2147483647, 1.0f}}) {
+    CascadeStage table = CalibrationStage(4);
+    table.offsetsScales[4] = wild;
+    const Window moved = calibrateWindows({At(100, 100, 48)}, table, image)[0];
+    EXPECT_EQ(moved.x, 100);
+    EXPECT_EQ(moved.y, 100);
+    EXPECT_EQ(moved.width, 48);
+    EXPECT_EQ(moved.height, 48);
+  }
 }
 
 }  // namespace
