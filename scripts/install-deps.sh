@@ -11,7 +11,7 @@ fi
 export DEBIAN_FRONTEND=noninteractive
 apt-get update
 apt-get install -y --no-install-recommends \
-  build-essential cmake pkg-config binutils \
+  build-essential cmake pkg-config binutils clang libclang-rt-14-dev \
   protobuf-compiler libprotobuf-dev \
   libgoogle-glog-dev \
   libopencv-dev \

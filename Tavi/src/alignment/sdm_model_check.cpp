@@ -47,8 +47,10 @@ class LayoutWalk {
       return {};
     }
     std::vector<Value> values(static_cast<size_t>(count));
-    std::memcpy(values.data(), bytes_.data() + at_, values.size() * 4);
-    at_ += values.size() * 4;
+    if (!values.empty()) {
+      std::memcpy(values.data(), bytes_.data() + at_, values.size() * 4);
+      at_ += values.size() * 4;
+    }
     return values;
   }
 
@@ -107,7 +109,7 @@ std::string layoutFault(LayoutWalk& walk, SDMCheck check) {
   if (walk.shortOfBytes()) return "cut short";
   if (for68 && walk.left() != 0) return std::to_string(walk.left()) + " bytes after the model";
   if (scalesPerOctave < 1 || scalesPerOctave > 16) return "scales per octave must be 1 to 16";
-  if (faceWidth < 8 || faceWidth > 4096) return "the face width must be 8 to 4096 pixels";
+  if (faceWidth < 8 || faceWidth > 1024) return "the face width must be 8 to 1024 pixels";
   for (int32_t level : levels) {
     if (level < 0 || level > scalesPerOctave + 2) {
       return "a stage level outside 0 to " + std::to_string(scalesPerOctave + 2);

@@ -86,6 +86,9 @@ std::vector<Window> calibrateWindows(std::vector<Window> windows, CascadeStage& 
     // enlarges it. Values are truncated as the detector always did; one
     // that no 32-bit integer holds (a scale of 0, an offset near 2^31)
     // cannot land inside the image, and the window stays.
+    if (correction.scale == 0.0f) {
+      continue;
+    }
     int64_t shiftX = 0;
     int64_t shiftY = 0;
     int64_t width = 0;

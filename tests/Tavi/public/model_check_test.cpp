@@ -107,7 +107,7 @@ TEST(ModelCheckTest, NamesTheFaultOfABrokenLandmarkModel) {
       {shipped.substr(0, shipped.size() - 2), "cut short"},
       {shipped + "tail", "4 bytes after the model"},
       {withWordFromEnd(2, -3), "scales per octave must be 1 to 16"},
-      {withWordFromEnd(1, 0), "the face width must be 8 to 4096 pixels"},
+      {withWordFromEnd(1, 0), "the face width must be 8 to 1024 pixels"},
       {withWordFromEnd(5, 9), "a stage level outside 0 to 5"},
       {std::string(), "cut short before its stages"},
   };
