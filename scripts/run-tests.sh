@@ -34,7 +34,8 @@ checked() {
 }
 ASAN_OPTIONS=allocator_may_return_null=1:detect_leaks=1 UBSAN_OPTIONS=print_stacktrace=1 \
   checked build-asan -DTAVI_SANITIZE=address,undefined,float-cast-overflow,float-divide-by-zero
-GTEST_DEATH_TEST_STYLE=threadsafe TSAN_OPTIONS=halt_on_error=1 \
+GTEST_DEATH_TEST_STYLE=threadsafe \
+  TSAN_OPTIONS="halt_on_error=1 allocator_may_return_null=1 suppressions=$PWD/tests/tsan.supp" \
   checked build-tsan -DTAVI_SANITIZE=thread -DTAVI_PORTABLE=ON
 
 bash scripts/run-fuzzers.sh 60
