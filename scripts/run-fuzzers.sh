@@ -9,7 +9,7 @@ seconds=${1:-60}
 
 CC=clang CXX=clang++ cmake -S . -B build-fuzz -DCMAKE_BUILD_TYPE=RelWithDebInfo \
   -DTAVI_BUILD_FUZZERS=ON -DTAVI_BUILD_TOOLS=OFF -DTAVI_BUILD_TESTS=OFF -DTAVI_BUILD_BENCHMARKS=OFF
-cmake --build build-fuzz -j "$(nproc)"
+cmake --build build-fuzz -j "$(nproc)" --target net_parsers_fuzz landmark_model_fuzz cascade_files_fuzz
 for target in net_parsers landmark_model cascade_files; do
   corpus=build-fuzz/corpus/$target
   mkdir -p "$corpus"

@@ -4,9 +4,18 @@
 #include <cstdint>
 #include <string>
 
+#include <google/protobuf/stubs/logging.h>
+
 #include "nn/proto/nn.pb.h"
 #include "nn/util/io.h"
 #include "nn/util/upgrade_proto.h"
+
+extern "C" int LLVMFuzzerInitialize(int*, char***) {
+  // Parse errors are expected by the thousand; their log lines would drown
+  // the fuzzer's own.
+  google::protobuf::SetLogHandler(nullptr);
+  return 0;
+}
 
 extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   const std::string bytes(reinterpret_cast<const char*>(data), size);

@@ -102,6 +102,11 @@ TEST(ModelCheckTest, NamesTheFaultOfABrokenLandmarkModel) {
     std::memcpy(&bytes[bytes.size() - 4 * wordsFromEnd], &value, 4);
     return bytes;
   };
+  auto withWordFromStart = [&shipped](size_t word, int32_t value) {
+    std::string bytes = shipped;
+    std::memcpy(&bytes[4 * word], &value, 4);
+    return bytes;
+  };
   const std::vector<std::pair<std::string, std::string>> faults = {
       {shipped.substr(0, 64), "cut short before its stages"},
       {shipped.substr(0, shipped.size() - 2), "cut short"},
@@ -110,13 +115,18 @@ TEST(ModelCheckTest, NamesTheFaultOfABrokenLandmarkModel) {
       {withWordFromEnd(1, 0), "the face width must be 8 to 1024 pixels"},
       {withWordFromEnd(5, 9), "a stage level outside 0 to 5"},
       {std::string(), "cut short before its stages"},
+      // Found by fuzzing: a negative count of stage matrices.
+      {withWordFromStart(0, -1), "cut short before its stages"},
   };
   TempDir dir;
   for (const auto& [bytes, fault] : faults) {
     WriteFile(dir.path() + "/model.sdm", bytes);
     EXPECT_EQ(checkSDMModel(dir.path(), "model.sdm", message), STATUS_MODEL_LOAD_FAILED);
     EXPECT_EQ(message, dir.path() + "/model.sdm: " + fault);
+    // All but trailing bytes also keep the model from loading.
+    EXPECT_EQ(loadSDMModel(dir.path(), "model.sdm") == STATUS_OK, bytes == shipped + "tail");
   }
+  unloadSDMModel();
   EXPECT_EQ(checkSDMModel(dir.path(), "absent.sdm", message), STATUS_MODEL_LOAD_FAILED);
   EXPECT_EQ(message, dir.path() + "/absent.sdm: missing or not a file");
 }

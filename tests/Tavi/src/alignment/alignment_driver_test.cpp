@@ -154,11 +154,15 @@ TEST_F(AlignmentDriverTest, UnsafeModelsAndInputsAreRefused) {
   std::vector<uint8_t> bytes = NoiseBytes(200, 200, 5);
   const Image image{200, 200, 0, bytes.data()};
   std::vector<float> points;
-  std::vector<ModelContents> unsafe(4, RandomStagesModel(1, 9));
+  std::vector<ModelContents> unsafe(6, RandomStagesModel(1, 9));
   unsafe[0].scalesPerOctave = -2;
   unsafe[1].stageLevels = {9};
   unsafe[2].stageMaps[0].projection = mp::matrix(68 * 128, 100);
   unsafe[3].stageMaps[0].mean = mp::matrix(1, 60 * 128);
+  // Found by fuzzing: a point of the mean shape at 1e25 box sizes padded the
+  // image by more than an int holds; a NaN in a map would do the same later.
+  unsafe[4].meanShape[7] = 1e25f;
+  unsafe[5].stageMaps[0].projection.data()[1000] = std::numeric_limits<float>::quiet_NaN();
   for (const ModelContents& model : unsafe) {
     dir_.write("unsafe.bin", ModelBytes(model));
     EXPECT_EQ(loadSDMModel(dir_.path(), "unsafe.bin"), STATUS_MODEL_LOAD_FAILED);
