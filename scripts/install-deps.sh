@@ -20,4 +20,5 @@ apt-get install -y --no-install-recommends \
   libleveldb-dev libsnappy-dev \
   libgtest-dev libgmock-dev \
   libbenchmark-dev \
-  libboost-program-options-dev liblapacke-dev nlohmann-json3-dev
+  libboost-program-options-dev liblapacke-dev nlohmann-json3-dev \
+  python3-dev pybind11-dev python3-numpy python3-pytest python3-opencv

@@ -28,3 +28,12 @@ g++ -std=c++17 "$source/tests/install/consumer.cpp" -o "$scratch/pc-consumer" \
 output=$("$prefix/bin/tavi" detect --landmarks 5 "$source/samples/astronaut.png")
 echo "$output"
 grep -q '"faces":\[{"box"' <<< "$output"
+
+# The installed Python module, where one was built, with the installed models.
+site=$(echo "$prefix"/lib/python3*/dist-packages)
+if [ -d "$site" ]; then
+  PYTHONPATH="$site" /usr/bin/python3 -c "
+import sys, tavi
+assert tavi.default_models.startswith(sys.argv[1]), tavi.default_models
+tavi.Detector(); tavi.Landmarks()" "$prefix"
+fi
