@@ -21,4 +21,4 @@ apt-get install -y --no-install-recommends \
   libgtest-dev libgmock-dev \
   libbenchmark-dev \
   libboost-program-options-dev liblapacke-dev nlohmann-json3-dev \
-  python3-dev pybind11-dev python3-numpy python3-pytest python3-opencv
+  python3-dev pybind11-dev python3-numpy python3-pytest python3-opencv python3-distributed
