@@ -12,6 +12,7 @@ import argparse
 import json
 import os
 import threading
+import time
 
 import cv2
 from dask.distributed import Client, LocalCluster, get_worker, progress
@@ -96,9 +97,12 @@ def main():
         # One thread a worker: each holds one detector and runs on one core.
         client = Client(LocalCluster(n_workers=args.workers, threads_per_worker=1,
                                      env={"OPENBLAS_NUM_THREADS": "1"}))
+    start = time.monotonic()
     images, failures = run(client, args.photos, args.out, args.partitions,
                            args.min_face, args.landmarks)
-    print("\n%d images, %d failed; results in %s" % (images, failures, args.out))
+    seconds = time.monotonic() - start
+    print("\n%d images, %d failed, in %.1f s (%.1f images/s); results in %s"
+          % (images, failures, seconds, images / seconds, args.out))
     client.close()
 
 

@@ -72,3 +72,28 @@ def test_threads_with_their_own_detectors_agree(photo):
     for thread in threads:
         thread.join()
     assert all(runs == [expected] * 3 for runs in results)
+
+
+def test_a_detector_shared_by_two_threads_refuses_the_second(photo):
+    detector = tavi.Detector()
+    large = cv2.resize(photo, (2560, 2560))
+    expected = [face.box for face in detector.detect(large, min_face=20)]
+    outcomes = []
+
+    def work():
+        try:
+            outcomes.append([face.box for face in detector.detect(large, min_face=20)])
+        except RuntimeError as error:
+            outcomes.append(str(error))
+
+    for _ in range(5):  # until the two calls overlap
+        outcomes.clear()
+        threads = [threading.Thread(target=work) for _ in range(2)]
+        for thread in threads:
+            thread.start()
+        for thread in threads:
+            thread.join()
+        if any(isinstance(outcome, str) for outcome in outcomes):
+            break
+    assert "create one Detector per thread" in " ".join(o for o in outcomes if isinstance(o, str))
+    assert all(outcome == expected for outcome in outcomes if not isinstance(outcome, str))
