@@ -53,7 +53,7 @@ void WriteMixedFolder(const std::string& folder) {
   cv::cvtColor(colour, grey, cv::COLOR_BGR2GRAY);
   cv::cvtColor(colour, alpha, cv::COLOR_BGR2BGRA);
   fs::create_directories(folder + "/inner");
-  cv::imwrite(folder + "/a,colour.png", colour);
+  cv::imwrite(folder + "/a,\"colour\".png", colour);
   cv::imwrite(folder + "/b-grey.png", grey);
   cv::imwrite(folder + "/inner/c-alpha.png", alpha);
   std::vector<uchar> jpeg;
@@ -74,7 +74,7 @@ TEST(TaviToolTest, ReportsEveryFileOfAMixedFolderInOrderAndDrawsWhole) {
                           " " + dir.path() + "/absent.png");
   EXPECT_EQ(run.status, 1);
   const std::vector<nlohmann::json> lines = JsonLines(run.output);
-  const std::vector<std::string> names = {"a,colour.png", "b-grey.png", "d-photo.jpg", "e-cut.jpg",
+  const std::vector<std::string> names = {"a,\"colour\".png", "b-grey.png", "d-photo.jpg", "e-cut.jpg",
                                           "f-notes.txt", "inner/c-alpha.png", "absent.png"};
   ASSERT_EQ(lines.size(), names.size());
   for (size_t i = 0; i < names.size(); ++i) {
@@ -97,14 +97,16 @@ TEST(TaviToolTest, ReportsEveryFileOfAMixedFolderInOrderAndDrawsWhole) {
     EXPECT_EQ(entry.path().string().find(".partial"), std::string::npos) << entry.path();
   }
 
-  // One thread gives the same lines; CSV quotes the name holding a comma.
+  // One thread gives the same lines; CSV quotes the name holding a comma and
+  // doubles its quotes.
   const ToolRun single = RunTool("detect --landmarks 68 " + input);
   EXPECT_EQ(single.output.substr(0, single.output.find("e-cut")),
             run.output.substr(0, run.output.find("e-cut")));
-  const ToolRun csv = RunTool("detect --csv --landmarks 5 " + input + "/a,colour.png");
+  const ToolRun csv = RunTool("detect --csv --landmarks 5 '" + input + "/a,\"colour\".png'");
   EXPECT_EQ(csv.status, 0);
   EXPECT_EQ(csv.output.find("file,width,height,min_face,face,left,top,right,bottom,score,x0,y0,"), 0u);
-  EXPECT_NE(csv.output.find("\n\"" + input + "/a,colour.png\",512,512,40,0,"), std::string::npos);
+  EXPECT_NE(csv.output.find("\n\"" + input + "/a,\"\"colour\"\".png\",512,512,40,0,"),
+            std::string::npos);
 }
 
 TEST(TaviToolTest, RefusesBadOptionsAndBrokenModelsBeforeAnyImage) {

@@ -3,6 +3,7 @@
 #include <gtest/gtest.h>
 
 #include <algorithm>
+#include <cmath>
 #include <cstdint>
 #include <vector>
 
@@ -182,6 +183,26 @@ TEST(FitFaceTest, RegressesAtTheFaceWidthAndAnswersInTheUnitsPixels) {
   std::vector<float> expected = coordinateMedian(startShapes(kMean, unit.faceRect));
   for (float& v : expected) v /= 1.5f;
   EXPECT_EQ(result, expected);
+}
+
+// Features are the descriptor bytes over 256: every one times 256 is a whole
+// number below 256, and a textured image gives some that are not 0.
+TEST(FaceFeaturesTest, AreDescriptorBytesOver256) {
+  cv::Mat noise(120, 120, CV_8UC1);
+  cv::randu(noise, 0, 256);
+  const std::vector<float> shape = {40.0f, 50.0f, 70.0f, 60.0f};
+  FaceFeatures features(noise, shape, 3, 1);
+  std::vector<float> padded = shape;
+  for (float& v : padded) v += static_cast<float>(features.pad());
+  std::vector<float> row(2 * 128);
+  features.compute(padded, 1, row.data());
+  float largest = 0.0f;
+  for (float value : row) {
+    ASSERT_EQ(value * 256.0f, std::floor(value * 256.0f)) << value;
+    ASSERT_LT(value * 256.0f, 256.0f);
+    largest = std::max(largest, value);
+  }
+  EXPECT_GT(largest, 0.0f);
 }
 
 }  // namespace
