@@ -1,21 +1,20 @@
 """The Dask example on a small local cluster: every image gets a result."""
-import importlib.util
 import json
 import os
 import shutil
+import sys
 
 import pytest
 from dask.distributed import Client, LocalCluster
 
-EXAMPLE = os.path.join(os.path.dirname(__file__), "..", "..", "examples", "dask_faces.py")
+EXAMPLES = os.path.join(os.path.dirname(__file__), "..", "..", "examples")
 
 
 @pytest.fixture(scope="module")
 def example():
-    spec = importlib.util.spec_from_file_location("dask_faces", EXAMPLE)
-    module = importlib.util.module_from_spec(spec)
-    spec.loader.exec_module(module)
-    return module
+    sys.path.insert(0, EXAMPLES)
+    import dask_faces
+    return dask_faces
 
 
 def test_every_image_gets_a_line_and_a_bad_one_its_error(example, tmp_path):
