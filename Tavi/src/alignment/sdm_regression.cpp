@@ -107,23 +107,37 @@ int padForShape(const cv::Mat& image, const std::vector<float>& shape, cv::Mat& 
 
 void applyStage(const float* feature, const mp::pca_map& map, const mp::matrix& bias,
                 std::vector<float>& shape) {
+  applyStage(feature, map, bias, &shape, 1);
+}
+
+void applyStage(const float* features, const mp::pca_map& map, const mp::matrix& bias,
+                std::vector<float>* shapes, size_t count) {
+  if (count == 0) return;
   const int D = map.mean.columns();
   const int K = map.projection.columns();
-  std::vector<float> tmp(std::max(D, 0));
-  nn::vsSub(D, feature, map.mean.data(), tmp.data());
-  std::vector<float> delta(std::max<size_t>(shape.size(), static_cast<size_t>(std::max(K, 0))), 0.0f);
+  const size_t rowLength = static_cast<size_t>(std::max(D, 0));
+  std::vector<float> tmp(count * rowLength);
+  for (size_t r = 0; r < count; ++r) {
+    nn::vsSub(D, features + r * rowLength, map.mean.data(), tmp.data() + r * rowLength);
+  }
+  const size_t stride = std::max(shapes[0].size(), static_cast<size_t>(std::max(K, 0)));
+  std::vector<float> delta(count * stride, 0.0f);
   // An empty map leaves delta at zero, which the product would give too.
   if (D > 0 && K > 0) {
-    cblas_sgemm(CblasRowMajor, CblasNoTrans, CblasNoTrans, 1, K, D, 1.0f, tmp.data(), D,
-                map.projection.data(), K, 0.0f, delta.data(), K);
+    cblas_sgemm(CblasRowMajor, CblasNoTrans, CblasNoTrans, static_cast<int>(count), K, D, 1.0f,
+                tmp.data(), D, map.projection.data(), K, 0.0f, delta.data(), static_cast<int>(stride));
   }
-  const bool withBias =
-      bias.data() != nullptr && bias.size() == static_cast<int64_t>(shape.size());
-  for (size_t q = 0; q < shape.size(); ++q) {
-    if (withBias) {
-      shape[q] += bias.data()[q] + delta[q];
-    } else {
-      shape[q] += delta[q];
+  for (size_t r = 0; r < count; ++r) {
+    std::vector<float>& shape = shapes[r];
+    const float* d = delta.data() + r * stride;
+    const bool withBias =
+        bias.data() != nullptr && bias.size() == static_cast<int64_t>(shape.size());
+    for (size_t q = 0; q < shape.size(); ++q) {
+      if (withBias) {
+        shape[q] += bias.data()[q] + d[q];
+      } else {
+        shape[q] += d[q];
+      }
     }
   }
 }
@@ -151,14 +165,17 @@ FaceFeatures::FaceFeatures(const cv::Mat& image, const std::vector<float>& start
       std::min<int64_t>(highestLevel, static_cast<int64_t>(scalesPerOctave) + 2)));
 }
 
-void FaceFeatures::compute(const std::vector<float>& paddedShape, int32_t level, float* feature) {
+bool FaceFeatures::compute(const std::vector<float>& paddedShape, int32_t level, float* feature) {
+  bool firstKept = false;
   for (size_t j = 0; j < paddedShape.size() / 2; ++j) {
     float norm = 0.0f;
     pyramid_.computeDescriptor(paddedShape[2 * j], paddedShape[2 * j + 1],
-                               static_cast<float>(level), norm, descriptor_);
+                               static_cast<float>(level), norm, descriptor_.data());
+    if (j == 0) firstKept = norm == 0.0f;
     float* row = feature + j * 128;
     for (int t = 0; t < 128; ++t) row[t] = static_cast<float>(descriptor_[t]) * 0.00390625f;
   }
+  return firstKept;
 }
 
 int32_t highestStageLevel(const SDMModel& model) {
@@ -169,28 +186,88 @@ int32_t highestStageLevel(const SDMModel& model) {
   return highest;
 }
 
+namespace {
+
+const mp::matrix& stageBias(const SDMModel& model, size_t i) {
+  static const mp::matrix noBias;
+  const bool useBiases = !model.stageMatrices.empty() && !model.stageBiases.empty();
+  return useBiases && i < model.stageBiases.size() ? model.stageBiases[i] : noBias;
+}
+
+// Each shape (in padded pixels) through all stages before the next, one
+// descriptor buffer for the face.
+void regressOneByOne(const SDMModel& model, FaceFeatures& features,
+                     std::vector<std::vector<float>>& shapes) {
+  std::vector<float> feature(model.meanShape.size() / 2 * 128);
+  for (std::vector<float>& shape : shapes) {
+    for (size_t i = 0; i < model.stageMaps.size(); ++i) {
+      features.compute(shape, stageLevel(model, i), feature.data());
+      applyStage(feature.data(), model.stageMaps[i], stageBias(model, i), shape);
+    }
+  }
+}
+
+// All shapes through one stage after the other, one product a stage. Each
+// row starts from the buffer the one-by-one order would hand it: what the
+// same shape left at the stage before. At stage 0 that order hands a shape
+// the buffer of the previous shape's last stage, not known yet; false if a
+// row depends on it (its first point kept the buffer), and then the shapes
+// are half-way and must be started again.
+bool regressTogether(const SDMModel& model, FaceFeatures& features,
+                     std::vector<std::vector<float>>& shapes) {
+  const size_t rowLength = model.meanShape.size() / 2 * 128;
+  std::vector<float> rows(shapes.size() * rowLength);
+  std::vector<FaceFeatures::Descriptor> carried(shapes.size(), FaceFeatures::Descriptor{});
+  for (size_t i = 0; i < model.stageMaps.size(); ++i) {
+    for (size_t k = 0; k < shapes.size(); ++k) {
+      features.setBuffer(carried[k]);
+      const bool dependsOnBefore =
+          features.compute(shapes[k], stageLevel(model, i), rows.data() + k * rowLength);
+      if (dependsOnBefore && i == 0 && k > 0) return false;
+      carried[k] = features.buffer();
+    }
+    applyStage(rows.data(), model.stageMaps[i], stageBias(model, i), shapes.data(), shapes.size());
+  }
+  return true;
+}
+
+std::vector<std::vector<float>> paddedStarts(const std::vector<std::vector<float>>& starts,
+                                             float padding) {
+  std::vector<std::vector<float>> shapes = starts;
+  for (std::vector<float>& shape : shapes) {
+    for (float& v : shape) v += padding;
+  }
+  return shapes;
+}
+
+std::vector<float> unpaddedMedian(const std::vector<std::vector<float>>& shapes, float padding) {
+  std::vector<float> result = coordinateMedian(shapes);
+  for (float& v : result) v -= padding;
+  return result;
+}
+
+}  // namespace
+
 std::vector<float> regressShapes(const SDMModel& model, const cv::Mat& image,
                                  const std::vector<std::vector<float>>& starts) {
   FaceFeatures features(image, starts.at(0), model.scalesPerOctave, highestStageLevel(model));
   const float padding = static_cast<float>(features.pad());
-  std::vector<float> feature(model.meanShape.size() / 2 * 128);
-  const mp::matrix noBias;
-  const bool useBiases = !model.stageMatrices.empty() && !model.stageBiases.empty();
-
-  std::vector<std::vector<float>> shapes = starts;
-  for (std::vector<float>& shape : shapes) {
-    for (float& v : shape) v += padding;
-    for (size_t i = 0; i < model.stageMaps.size(); ++i) {
-      features.compute(shape, stageLevel(model, i), feature.data());
-      const mp::matrix& bias =
-          useBiases && i < model.stageBiases.size() ? model.stageBiases[i] : noBias;
-      applyStage(feature.data(), model.stageMaps[i], bias, shape);
-    }
+  std::vector<std::vector<float>> shapes = paddedStarts(starts, padding);
+  if (!regressTogether(model, features, shapes)) {
+    shapes = paddedStarts(starts, padding);
+    features.setBuffer(FaceFeatures::Descriptor{});
+    regressOneByOne(model, features, shapes);
   }
+  return unpaddedMedian(shapes, padding);
+}
 
-  std::vector<float> result = coordinateMedian(shapes);
-  for (float& v : result) v -= padding;
-  return result;
+std::vector<float> regressShapesOneByOne(const SDMModel& model, const cv::Mat& image,
+                                         const std::vector<std::vector<float>>& starts) {
+  FaceFeatures features(image, starts.at(0), model.scalesPerOctave, highestStageLevel(model));
+  const float padding = static_cast<float>(features.pad());
+  std::vector<std::vector<float>> shapes = paddedStarts(starts, padding);
+  regressOneByOne(model, features, shapes);
+  return unpaddedMedian(shapes, padding);
 }
 
 std::vector<float> fitFace(const SDMModel& model, GeneralUnit& unit) {

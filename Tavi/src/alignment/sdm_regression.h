@@ -1,6 +1,8 @@
 #ifndef TAVI_SRC_ALIGNMENT_SDM_REGRESSION_H_
 #define TAVI_SRC_ALIGNMENT_SDM_REGRESSION_H_
 
+#include <array>
+#include <cstddef>
 #include <cstdint>
 #include <vector>
 
@@ -86,23 +88,39 @@ class FaceFeatures {
   // The padding on each side; shapes given to compute are in padded pixels.
   int pad() const { return pad_; }
   // The feature row of the shape at a pyramid level: each point's
-  // descriptor bytes divided by 256, 128 floats a point.
-  void compute(const std::vector<float>& paddedShape, int32_t level, float* feature);
+  // descriptor bytes divided by 256, 128 floats a point. Returns whether the
+  // first point kept the buffer's bytes, that is whether the row depends on
+  // what was computed before it.
+  bool compute(const std::vector<float>& paddedShape, int32_t level, float* feature);
+
+  // The shared buffer: the bytes a point without usable gradients repeats.
+  // Zero until the first descriptor.
+  using Descriptor = std::array<uint8_t, 128>;
+  const Descriptor& buffer() const { return descriptor_; }
+  void setBuffer(const Descriptor& bytes) { descriptor_ = bytes; }
 
  private:
   cv::Mat padded_;
   int pad_;
   SiftPyramid pyramid_;
-  uint8_t descriptor_[128] = {};
+  Descriptor descriptor_ = {};
 };
 
 // The highest pyramid level that a stage of the model reads.
 int32_t highestStageLevel(const SDMModel& model);
 
 // Runs every start through all stages of model on image and returns the
-// coordinate-wise median of the results, in image's pixels.
+// coordinate-wise median of the results, in image's pixels. All starts take a
+// stage together, in one product; the result is that of running the starts
+// one after the other (regressShapesOneByOne) up to the order of summation
+// inside the products.
 std::vector<float> regressShapes(const SDMModel& model, const cv::Mat& image,
                                  const std::vector<std::vector<float>>& starts);
+
+// The same, each start through all stages before the next: the reference the
+// batched road is measured against.
+std::vector<float> regressShapesOneByOne(const SDMModel& model, const cv::Mat& image,
+                                         const std::vector<std::vector<float>>& starts);
 
 // One stage in place: shape += bias + (feature - map.mean) * map.projection,
 // the bias only if it has exactly as many elements as the shape.
@@ -110,6 +128,10 @@ std::vector<float> regressShapes(const SDMModel& model, const cv::Mat& image,
 //   many rows and at most shape.size() columns.
 void applyStage(const float* feature, const mp::pca_map& map, const mp::matrix& bias,
                 std::vector<float>& shape);
+// The same for several shapes at once, one feature row each (rows of
+// map.mean.columns() floats, one after the other), in one product.
+void applyStage(const float* features, const mp::pca_map& map, const mp::matrix& bias,
+                std::vector<float>* shapes, size_t count);
 
 // For each coordinate, the value at position n / 2 of the n shapes' values in
 // ascending order; x and y are taken apart.

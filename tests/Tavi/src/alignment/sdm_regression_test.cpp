@@ -8,6 +8,9 @@
 #include <vector>
 
 #include <opencv2/core.hpp>
+#include <opencv2/imgcodecs.hpp>
+
+#include "alignment/alignment_frame.h"
 
 #include "alignment/sdm_model.h"
 
@@ -165,6 +168,48 @@ TEST(RegressShapesTest, StagesTakeTheirLevelsAndThoseBeyondTheListItsLast) {
   model.stageMaps.push_back(BlockSumMap());
   model.stageMaps.back().projection.fill(0.0f);
   EXPECT_EQ(regressShapes(model, HalfTextured(), {start}), spelled);
+}
+
+// Taking all starts through a stage together must give what taking them one
+// by one gives, also where descriptors repeat the buffer: at a later stage
+// (point 0 is moved into the flat part by the first stage's bias), and at the
+// first stage of a start after the first (point 0 starts in the flat part).
+TEST(RegressShapesTest, StartsTakenTogetherEndWhereTakenOneByOne) {
+  SDMModel model;
+  model.meanShape = {0.0f, 0.0f, 0.0f, 0.0f};
+  model.stageMaps.assign(3, BlockSumMap());
+  model.stageLevels = {0, 1, 0};
+  model.stageBiases = {Row({60.0f, 0.0f, 0.0f, 0.0f}), Row({0, 0, 0, 0}), Row({-60.0f, 0.0f, 0.0f, 0.0f})};
+  model.stageMatrices.push_back(mp::matrix(1, 1));
+  const cv::Mat image = HalfTextured();
+  std::vector<std::vector<float>> starts = {
+      {40.0f, 50.0f, 30.0f, 40.0f}, {45.0f, 30.0f, 20.0f, 60.0f}, {50.0f, 70.0f, 60.0f, 20.0f}};
+  EXPECT_EQ(regressShapes(model, image, starts), regressShapesOneByOne(model, image, starts));
+  // Of two starts the median takes the larger value: start 1's x of point 0.
+  starts = {starts[0], {150.0f, 50.0f, 30.0f, 40.0f}};
+  EXPECT_EQ(regressShapes(model, image, starts), regressShapesOneByOne(model, image, starts));
+}
+
+// The same on a real face with the shipped model, up to the order of
+// summation inside the products: within 0.01 pixel.
+TEST(RegressShapesTest, StartsTakenTogetherPlaceTheShippedModelsPointsAsOneByOne) {
+  SDMModel model;
+  ASSERT_TRUE(readSDMModel(TAVI_SOURCE_DIR "/Tavi/public/landmarks.sdm", model));
+  const cv::Mat photo = cv::imread(TAVI_SOURCE_DIR "/samples/astronaut.png");
+  ASSERT_FALSE(photo.empty());
+  for (float shift : {-12.0f, 0.0f, 7.0f}) {
+    const tavilib::AlignmentFrame frame =
+        tavilib::makeAlignmentFrame(photo, {173.0f + shift, 77.0f, 260.0f + shift, 164.0f - shift});
+    GeneralUnit unit;
+    unit.image = frame.grey;
+    unit.faceRect = frame.faceRect;
+    unit.normalize(model.faceWidth);
+    const std::vector<std::vector<float>> starts = startShapes(model.meanShape, unit.faceRect);
+    const std::vector<float> together = regressShapes(model, unit.image, starts);
+    const std::vector<float> oneByOne = regressShapesOneByOne(model, unit.image, starts);
+    ASSERT_EQ(together.size(), 136u);
+    for (size_t q = 0; q < together.size(); ++q) EXPECT_NEAR(together[q], oneByOne[q], 0.01f) << q;
+  }
 }
 
 // The unit is scaled to the face width (the box's fields truncated), regressed
