@@ -24,6 +24,9 @@ struct OffsetScale {
 // One network of the cascade and what belongs to it.
 struct CascadeStage {
   boost::shared_ptr<nn::Net<float>> net;
+  // The same net for several windows at once, sharing its weights; made by
+  // the grading at first use.
+  boost::shared_ptr<nn::Net<float>> batchNet;
   // Calibration classes; empty in all but the calibration stage.
   std::vector<OffsetScale> offsetsScales;
   // Mean image, plane by plane, of the net's input size; empty in the first

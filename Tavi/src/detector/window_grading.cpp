@@ -4,6 +4,7 @@
 
 #include <algorithm>
 #include <cstdint>
+#include <vector>
 
 #include "detector/image_planes.h"
 #include "nn/net.h"
@@ -25,17 +26,68 @@ bool truncated(float value, int64_t& result) {
   return true;
 }
 
-// Cuts the window out, resizes it to the net's input, subtracts the stage's
-// mean and runs the net.
-void runOnWindow(const Window& window, CascadeStage& stage, const cv::Mat& image) {
-  nn::Blob<float>* input = stage.net->net_input_blobs()[0];
-  writeImagePlanes(cutWindow(image, window, input->width(), input->height()), input);
-  float* data = input->mutable_cpu_data();
-  // A mean shorter than the input (an incomplete mean file) covers only its
-  // own length.
-  const int meanCount = std::min(input->count(), static_cast<int>(stage.mean.size()));
-  nn::vsSub(meanCount, data, stage.mean.data(), data);
-  stage.net->Forward();
+// Windows a grading net takes in one pass where that many are left: its
+// inner products then read their weights once for all of them.
+constexpr int kWindowBatch = 8;
+
+// The stage's net for kWindowBatch windows, made at first use; null where its
+// "probs" are not one value a class of at least two classes, which the
+// normalisation below needs.
+nn::Net<float>* batchNet(CascadeStage& stage) {
+  if (!stage.batchNet) {
+    const nn::Blob<float>& probs = *stage.net->output_blob();
+    if (stage.net->net_input_blobs().size() != 1 || probs.height() * probs.width() != 1 ||
+        probs.channels() < 2) {
+      return nullptr;
+    }
+    stage.batchNet = stage.net->WithBatch(kWindowBatch);
+  }
+  return stage.batchNet.get();
+}
+
+// Image k's class probabilities. The softmax normalises the first image only;
+// a later one holds exp(logit - its largest logit), normalised here in the
+// softmax's own order of operations.
+void classProbabilities(const nn::Blob<float>& probs, int k, std::vector<float>& out) {
+  const int classes = probs.count() / std::max(probs.num(), 1);
+  const float* values = probs.cpu_data() + k * classes;
+  out.assign(values, values + classes);
+  if (k == 0) return;
+  float sum = values[0] + values[1];
+  for (int c = 2; c < classes; ++c) sum = values[c] + sum;
+  for (int c = 0; c < classes; ++c) out[c] = values[c] / sum;
+}
+
+// Cuts each window out, resizes it to the net's input, subtracts the stage's
+// mean and runs the net, kWindowBatch windows a pass while that many are
+// left; use receives each window's index and class probabilities.
+template <typename Use>
+void runOnWindows(const std::vector<Window>& windows, CascadeStage& stage, const cv::Mat& image,
+                  Use use) {
+  nn::Net<float>* batch = batchNet(stage);
+  std::vector<float> probabilities;
+  for (size_t first = 0; first < windows.size();) {
+    const bool together = batch != nullptr && windows.size() - first >= kWindowBatch;
+    nn::Net<float>& net = together ? *batch : *stage.net;
+    const int count = together ? kWindowBatch : 1;
+    nn::Blob<float>* input = net.net_input_blobs()[0];
+    const int perImage = input->count() / input->num();
+    // A mean shorter than the input (an incomplete mean file) covers only its
+    // own length.
+    const int meanCount = std::min(perImage, static_cast<int>(stage.mean.size()));
+    for (int k = 0; k < count; ++k) {
+      float* planes = input->mutable_cpu_data() + k * perImage;
+      writeImagePlanes(cutWindow(image, windows[first + k], input->width(), input->height()),
+                       planes, perImage);
+      nn::vsSub(meanCount, planes, stage.mean.data(), planes);
+    }
+    net.Forward();
+    for (int k = 0; k < count; ++k) {
+      classProbabilities(*net.output_blob(), k, probabilities);
+      use(first + k, probabilities);
+    }
+    first += count;
+  }
 }
 
 }  // namespace
@@ -54,32 +106,30 @@ cv::Mat cutWindow(const cv::Mat& image, const Window& window, int width, int hei
 
 std::vector<Window> gradeWindows(std::vector<Window> windows, CascadeStage& stage,
                                  const cv::Mat& image) {
-  for (Window& window : windows) {
-    runOnWindow(window, stage, image);
-    window.score = stage.net->output_blob()->cpu_data()[1];
-  }
+  runOnWindows(windows, stage, image, [&windows](size_t i, const std::vector<float>& probabilities) {
+    windows[i].score = probabilities[1];
+  });
   return windows;
 }
 
 std::vector<Window> calibrateWindows(std::vector<Window> windows, CascadeStage& calibration,
                                      const cv::Mat& image) {
-  const boost::shared_ptr<nn::Blob<float>> probs = calibration.net->output_blob();
-  const float* probabilities = probs->cpu_data();
+  const nn::Blob<float>& probs = *calibration.net->output_blob();
   // Only classes that both the table and the net have are looked at.
   const int classes = std::min(static_cast<int>(calibration.offsetsScales.size()),
-                               probs->count() / std::max(probs->num(), 1));
+                               probs.count() / std::max(probs.num(), 1));
   const nn::Blob<float>& input = *calibration.net->net_input_blobs()[0];
   const float inputWidth = static_cast<float>(input.width());
   const float inputHeight = static_cast<float>(input.height());
   if (classes == 0) {
     return windows;
   }
-  for (Window& window : windows) {
-    runOnWindow(window, calibration, image);
+  runOnWindows(windows, calibration, image, [&](size_t i, const std::vector<float>& probabilities) {
+    Window& window = windows[i];
     // On a tie the lowest class wins; probabilities are never negative.
-    const int best = static_cast<int>(cblas_isamax(classes, probabilities, 1));
+    const int best = static_cast<int>(cblas_isamax(classes, probabilities.data(), 1));
     if (kCalibrationConfidence > probabilities[best]) {
-      continue;
+      return;
     }
     const OffsetScale& correction = calibration.offsetsScales[best];
     // A negative offset moves the window right or down; a scale below 1
@@ -87,7 +137,7 @@ std::vector<Window> calibrateWindows(std::vector<Window> windows, CascadeStage& 
     // that no 32-bit integer holds (a scale of 0, an offset near 2^31)
     // cannot land inside the image, and the window stays.
     if (correction.scale == 0.0f) {
-      continue;
+      return;
     }
     int64_t shiftX = 0;
     int64_t shiftY = 0;
@@ -99,7 +149,7 @@ std::vector<Window> calibrateWindows(std::vector<Window> windows, CascadeStage& 
                        static_cast<float>(window.height), shiftY) ||
         !truncated(static_cast<float>(window.width) / correction.scale, width) ||
         !truncated(static_cast<float>(window.height) / correction.scale, height)) {
-      continue;
+      return;
     }
     const int64_t x = window.x - shiftX;
     const int64_t y = window.y - shiftY;
@@ -110,7 +160,7 @@ std::vector<Window> calibrateWindows(std::vector<Window> windows, CascadeStage& 
       window.width = static_cast<int32_t>(width);
       window.height = static_cast<int32_t>(height);
     }
-  }
+  });
   return windows;
 }
 

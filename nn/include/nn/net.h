@@ -72,6 +72,12 @@ class Net {
   // blobs, its description and blobs: the binary weight-file form.
   void ToProto(NetParameter* param) const;
 
+  // A net of the same description taking num images at once, whose weights
+  // are this net's own blobs (shared, not copied). Its layers are made with
+  // constant fillers, so that making it draws no random numbers.
+  // REQUIRES: the net has one input.
+  boost::shared_ptr<Net> WithBatch(int num) const;
+
   // The blob named "probs"; empty if the net has none.
   boost::shared_ptr<Blob<Dtype>> output_blob() const;
 
@@ -96,6 +102,8 @@ class Net {
   const std::string& name() const { return name_; }
 
  private:
+  // The description as given, for WithBatch.
+  NetParameter description_;
   std::vector<boost::shared_ptr<Layer<Dtype>>> layers_;
   std::vector<std::string> layer_names_;
   std::map<std::string, int> layer_names_index_;

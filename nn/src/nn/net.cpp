@@ -41,6 +41,7 @@ Net<Dtype>::Net(const NetParameter& param) {
 
 template <typename Dtype>
 void Net<Dtype>::Init(const NetParameter& in_param) {
+  description_ = in_param;
   NetParameter param;
   InsertSplits(in_param, &param);
   name_ = param.name();
@@ -316,6 +317,26 @@ void Net<Dtype>::ToProto(NetParameter* param) const {
       layer->ToProto(param->add_layers());
     }
   }
+}
+
+template <typename Dtype>
+boost::shared_ptr<Net<Dtype>> Net<Dtype>::WithBatch(int num) const {
+  NetParameter param = description_;
+  CHECK_EQ(param.input_dim_size(), 4) << "WithBatch needs a net of one input.";
+  param.set_input_dim(0, num);
+  for (LayerParameter& layer : *param.mutable_layers()) {
+    if (layer.has_convolution_param()) {
+      layer.mutable_convolution_param()->clear_weight_filler();
+      layer.mutable_convolution_param()->clear_bias_filler();
+    }
+    if (layer.has_inner_product_param()) {
+      layer.mutable_inner_product_param()->clear_weight_filler();
+      layer.mutable_inner_product_param()->clear_bias_filler();
+    }
+  }
+  boost::shared_ptr<Net> batch(new Net(param));
+  for (size_t i = 0; i < params_.size(); ++i) batch->params_[i]->ShareData(*params_[i]);
+  return batch;
 }
 
 template <typename Dtype>

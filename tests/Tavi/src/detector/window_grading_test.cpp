@@ -5,7 +5,10 @@
 
 #include <cmath>
 
+#include <opencv2/imgcodecs.hpp>
+
 #include "detector/cascade_files.h"
+#include "detector/cascade_loader.h"
 #include "test_cascade.h"
 
 namespace tavilib {
@@ -40,6 +43,14 @@ TEST(WindowGradingTest, GradingReplacesScoresAndKeepsTheList) {
   EXPECT_FLOAT_EQ(graded[0].score, 1.0f / (1.0f + std::exp(-2.0f)));
   EXPECT_EQ(graded[1].x, 70);
   EXPECT_EQ(graded[1].level, 3);
+
+  // Nine windows, eight of them in one pass: each is normalised over all
+  // three classes.
+  CascadeStage three = ConstantStage({0.0f, 2.0f, 1.0f});
+  three.mean.assign(1728, 128.0f);
+  for (const Window& window : gradeWindows(std::vector<Window>(9, At(0, 0, 30)), three, image)) {
+    EXPECT_FLOAT_EQ(window.score, std::exp(2.0f) / (1.0f + std::exp(2.0f) + std::exp(1.0f)));
+  }
 
   EXPECT_THROW(gradeWindows({At(90, 0, 40)}, stage, image), cv::Exception)
       << "a window that leaves the image";
@@ -116,6 +127,31 @@ TEST(WindowGradingTest, CalibrationNeedsAClaimOfOneInTenWithinTheTable) {
     EXPECT_EQ(moved.y, 100);
     EXPECT_EQ(moved.width, 48);
     EXPECT_EQ(moved.height, 48);
+  }
+}
+
+// The shipped nets take windows eight at a time where eight are left; each
+// window must come out as it does alone: scores within 1e-6, the same moves.
+TEST(WindowGradingTest, WindowsTakenTogetherComeOutAsAlone) {
+  const cv::Mat photo = cv::imread(TAVI_SOURCE_DIR "/samples/astronaut.png");
+  ASSERT_FALSE(photo.empty());
+  std::vector<Window> windows;
+  for (int i = 0; i < 19; ++i) windows.push_back(At(150 + 7 * i, 60 + 5 * (i % 4), 80 + 9 * (i % 5)));
+  const std::string root = TAVI_SOURCE_DIR "/Tavi/public/cascades/";
+  for (const char* folder : {"x32Net", "x64Net"}) {
+    CascadeStage stage = loadDeployStage(root + folder);
+    const std::vector<Window> together = gradeWindows(windows, stage, photo);
+    for (size_t i = 0; i < windows.size(); ++i) {
+      EXPECT_NEAR(together[i].score, gradeWindows({windows[i]}, stage, photo)[0].score, 1e-6) << folder << i;
+    }
+  }
+  CascadeStage calibration = loadDeployStage(root + "x32Net-x32-3Scales-200");
+  calibration.offsetsScales = readOffsetsScales(root + "x32Net-x32-3Scales-200/offsets-scales");
+  const std::vector<Window> together = calibrateWindows(windows, calibration, photo);
+  for (size_t i = 0; i < windows.size(); ++i) {
+    const Window alone = calibrateWindows({windows[i]}, calibration, photo)[0];
+    EXPECT_EQ(cv::Rect(together[i].x, together[i].y, together[i].width, together[i].height),
+              cv::Rect(alone.x, alone.y, alone.width, alone.height)) << i;
   }
 }
 
