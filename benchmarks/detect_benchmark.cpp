@@ -13,6 +13,8 @@
 #include <opencv2/imgcodecs.hpp>
 #include <opencv2/imgproc.hpp>
 
+#include <chrono>
+#include <cmath>
 #include <cstdlib>
 #include <fstream>
 #include <iostream>
@@ -104,6 +106,54 @@ void BM_Detect(benchmark::State& state) {
   state.counters["faces"] = static_cast<double>(detections.size());
 }
 
+// The reference road: every window through the stage's net alone.
+std::vector<Window> GradeAlone(std::vector<Window> windows, tavilib::CascadeStage& stage,
+                               const cv::Mat& image) {
+  for (Window& window : windows) window = tavilib::gradeWindows({window}, stage, image)[0];
+  return windows;
+}
+
+std::vector<Window> CalibrateAlone(std::vector<Window> windows, tavilib::CascadeStage& stage,
+                                   const cv::Mat& image) {
+  for (Window& window : windows) window = tavilib::calibrateWindows({window}, stage, image)[0];
+  return windows;
+}
+
+// detect as the library runs it against the reference road, alternating in
+// one loop: their times, the ratio, and whether the faces are the same.
+void BM_DetectTogetherAgainstAlone(benchmark::State& state) {
+  const CascadeParameter scan = ScanFor(static_cast<int>(state.range(0)));
+  const tavilib::Image image{Photo().cols, Photo().rows, 0, Photo().data};
+  double together = 0;
+  double alone = 0;
+  bool same = true;
+  for (auto _ : state) {
+    std::vector<tavilib::Detection> library;
+    std::vector<tavilib::Detection> reference;
+    const auto t0 = std::chrono::steady_clock::now();
+    tavilib::runCascade(image, Shipped(), library, scan,
+                        {tavilib::scanPyramid, tavilib::gradeWindows, tavilib::calibrateWindows});
+    const auto t1 = std::chrono::steady_clock::now();
+    tavilib::runCascade(image, Shipped(), reference, scan,
+                        {tavilib::scanPyramid, GradeAlone, CalibrateAlone});
+    const auto t2 = std::chrono::steady_clock::now();
+    together += std::chrono::duration<double>(t1 - t0).count();
+    alone += std::chrono::duration<double>(t2 - t1).count();
+    same = same && library.size() == reference.size();
+    for (size_t i = 0; same && i < library.size(); ++i) {
+      same = library[i].box.left == reference[i].box.left && library[i].box.top == reference[i].box.top &&
+             library[i].box.right == reference[i].box.right &&
+             library[i].box.bottom == reference[i].box.bottom &&
+             std::abs(library[i].score - reference[i].score) <= 1e-6f;
+    }
+  }
+  const double n = static_cast<double>(state.iterations());
+  state.counters["together_ms"] = 1e3 * together / n;
+  state.counters["alone_ms"] = 1e3 * alone / n;
+  state.counters["speedup"] = alone / together;
+  state.counters["same_faces"] = same ? 1 : 0;
+}
+
 void BM_Scan(benchmark::State& state) {
   const CascadeParameter scan = ScanFor(static_cast<int>(state.range(0)));
   size_t windows = 0;
@@ -174,6 +224,7 @@ void BM_LoadedDetectorMemory(benchmark::State& state) {
 
 BENCHMARK(BM_LoadedDetectorMemory)->Iterations(1)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_Detect)->Arg(40)->Arg(20)->Unit(benchmark::kMillisecond);
+BENCHMARK(BM_DetectTogetherAgainstAlone)->Arg(40)->Arg(20)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_Scan)->Arg(40)->Arg(20)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_Grade)->Arg(1)->Arg(2)->Unit(benchmark::kMillisecond);
 BENCHMARK(BM_Calibrate)->Unit(benchmark::kMillisecond);
