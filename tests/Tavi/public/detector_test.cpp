@@ -16,56 +16,42 @@ TEST(DetectorParamsTest, ConstructorsBorrowThePointersAndSetReserved) {
   const char* root = "models/";
   const char* list = "cascade.list";
   DetectorParams params(root, list);
-  EXPECT_EQ(params.cascadeRoot, root);
-  EXPECT_EQ(params.cascadeList, list);
   EXPECT_EQ(params.reserved, 1);
-
   params.reserved = 7;
-  DetectorParams copy(params);
-  EXPECT_EQ(copy.cascadeRoot, root);
-  EXPECT_EQ(copy.reserved, 7);
   DetectorParams assigned;
   assigned = params;
-  EXPECT_EQ(assigned.cascadeList, list);
-  EXPECT_EQ(assigned.reserved, 7);
+  for (const DetectorParams& copy : {DetectorParams(params), assigned}) {
+    EXPECT_EQ(copy.cascadeRoot, root);
+    EXPECT_EQ(copy.cascadeList, list);
+    EXPECT_EQ(copy.reserved, 7);
+  }
 }
 
-TEST(DetectorTest, FailedLoadLeavesAStateThatRefusesToDetect) {
+TEST(DetectorTest, FailedLoadLeavesAStateThatRefusesToDetectAndCopiesShareIt) {
   Detector detector;
   EXPECT_FALSE(detector.is_loaded());
   EXPECT_EQ(detector.getDetector(), nullptr);
-  detector.unload();  // harmless when empty
-  unloadDetector(detector);
-  EXPECT_FALSE(detector.is_loaded());
-
+  unloadDetector(detector);  // harmless when empty
   std::vector<unsigned char> pixels(30 * 20 * 3, 128);
   const Image image{30, 20, 0, pixels.data()};
   const CascadeParameter params{1.0f, 320, 0.1f, 3, 1.5f, 12};
   std::vector<Detection> detections(3);
   EXPECT_EQ(detect(image, detector, detections, params), STATUS_DETECTOR_NOT_READY);
 
-  const DetectorParams nowhere;
-  EXPECT_EQ(loadDetector(detector, nowhere), STATUS_MODEL_LOAD_FAILED);
+  EXPECT_EQ(loadDetector(detector, DetectorParams()), STATUS_MODEL_LOAD_FAILED);
   EXPECT_TRUE(detector.is_loaded());
   EXPECT_NE(detector.getDetector(), nullptr);
   EXPECT_EQ(detect(image, detector, detections, params), STATUS_DETECTOR_NOT_READY);
   EXPECT_EQ(detections.size(), 3u);
 
-  detector.unload();
-  EXPECT_FALSE(detector.is_loaded());
-  EXPECT_EQ(detector.getDetector(), nullptr);
-}
-
-TEST(DetectorTest, AssignmentSharesTheStatePointer) {
-  Detector original;
-  original.load(DetectorParams());
   Detector copy;
-  copy = original;
-  EXPECT_EQ(copy.getDetector(), original.getDetector());
+  copy = detector;
+  EXPECT_EQ(copy.getDetector(), detector.getDetector());
   // Each copy would delete the shared state: let only one of them do it.
   copy.unload();
-  Detector empty;
-  original = empty;
+  EXPECT_FALSE(copy.is_loaded());
+  EXPECT_EQ(copy.getDetector(), nullptr);
+  detector = Detector();
 }
 
 }  // namespace

@@ -8,6 +8,9 @@
 
 namespace {
 
+using testing::Contains;
+using testing::StartsWith;
+
 // The demangled names of the symbols libtavi.so defines in its dynamic table.
 std::vector<std::string> ExportedSymbols() {
   const std::string command = std::string("nm -D --defined-only -C ") + TAVI_LIBRARY_PATH;
@@ -19,8 +22,7 @@ std::vector<std::string> ExportedSymbols() {
     // "<address> <type> <name>"
     std::string entry(line);
     entry.erase(entry.find_last_not_of('\n') + 1);
-    const size_t name_start = entry.find(' ', entry.find(' ') + 1);
-    names.push_back(entry.substr(name_start + 1));
+    names.push_back(entry.substr(entry.find(' ', entry.find(' ') + 1) + 1));
   }
   return names;
 }
@@ -29,33 +31,26 @@ TEST(ExportedSymbolsTest, OnlyTheTavilibInterfaceLeavesTheLibrary) {
   const std::vector<std::string> names = ExportedSymbols();
   ASSERT_FALSE(names.empty());
   for (const std::string& name : names) {
-    EXPECT_THAT(name, testing::StartsWith("tavilib::"));
+    EXPECT_THAT(name, StartsWith("tavilib::"));
   }
-  EXPECT_THAT(names, testing::Contains(testing::StartsWith(
-                         "tavilib::detect(tavilib::Image const&, tavilib::Detector const&, "
-                         "std::vector<tavilib::Detection")));
-  EXPECT_THAT(names, testing::Contains("tavilib::loadDetector(tavilib::Detector&)"));
-  EXPECT_THAT(names, testing::Contains(
-                         "tavilib::loadDetector(tavilib::Detector&, tavilib::DetectorParams const&)"));
-  EXPECT_THAT(names, testing::Contains("tavilib::unloadDetector(tavilib::Detector&)"));
-  EXPECT_THAT(names, testing::Contains("tavilib::Detector::load()"));
-  EXPECT_THAT(names, testing::Contains("tavilib::Detector::operator=(tavilib::Detector const&)"));
-  EXPECT_THAT(names, testing::Contains("tavilib::Detector::getDetector() const"));
-  EXPECT_THAT(names, testing::Contains("tavilib::DetectorParams::DetectorParams(char const* const&, "
-                                       "char const* const&)"));
-  EXPECT_THAT(names, testing::Contains("tavilib::scanSettingsFor(tavilib::Detector const&, int, int, "
-                                       "int, tavilib::ScanSettings&)"));
-  EXPECT_THAT(names, testing::Contains(testing::StartsWith(
-                         "tavilib::checkDetectorModel(tavilib::DetectorParams const&, std::")));
-  EXPECT_THAT(names, testing::Contains(testing::StartsWith("tavilib::checkSDMModel(std::")));
-  EXPECT_THAT(names, testing::Contains(testing::StartsWith("tavilib::loadSDMModel(std::")));
-  EXPECT_THAT(names, testing::Contains("tavilib::unloadSDMModel()"));
-  EXPECT_THAT(names, testing::Contains(testing::StartsWith(
-                         "tavilib::align68Points(tavilib::Image const&, "
-                         "tavilib::Rectangle<float> const&, std::vector<float")));
-  EXPECT_THAT(names, testing::Contains(testing::StartsWith(
-                         "tavilib::align5Points(tavilib::Image const&, "
-                         "tavilib::Rectangle<float> const&, std::vector<float")));
+  for (const char* entry : {
+           "tavilib::detect(tavilib::Image const&, tavilib::Detector const&, "
+           "std::vector<tavilib::Detection",
+           "tavilib::loadDetector(tavilib::Detector&)",
+           "tavilib::loadDetector(tavilib::Detector&, tavilib::DetectorParams const&)",
+           "tavilib::unloadDetector(tavilib::Detector&)", "tavilib::Detector::load()",
+           "tavilib::Detector::operator=(tavilib::Detector const&)",
+           "tavilib::Detector::getDetector() const",
+           "tavilib::DetectorParams::DetectorParams(char const* const&, char const* const&)",
+           "tavilib::scanSettingsFor(tavilib::Detector const&, int, int, int, tavilib::ScanSettings&)",
+           "tavilib::checkDetectorModel(tavilib::DetectorParams const&, std::",
+           "tavilib::checkSDMModel(std::", "tavilib::loadSDMModel(std::", "tavilib::unloadSDMModel()",
+           "tavilib::align68Points(tavilib::Image const&, tavilib::Rectangle<float> const&, "
+           "std::vector<float",
+           "tavilib::align5Points(tavilib::Image const&, tavilib::Rectangle<float> const&, "
+           "std::vector<float"}) {
+    EXPECT_THAT(names, Contains(StartsWith(entry)));
+  }
 }
 
 }  // namespace

@@ -18,30 +18,19 @@ std::vector<int> Shape(const nn::Blob<float>& blob) {
 }
 
 TEST(CascadeNetTextsTest, EachDescriptionAssemblesIntoItsNet) {
-  Net<float> stage0(kStage0NetText, NetDescription::kText);
-  EXPECT_EQ(stage0.name(), "900.175");
-  EXPECT_EQ(stage0.layers().size(), 7u) << "no split in the scan net";
-  EXPECT_EQ(Shape(*stage0.net_input_blobs()[0]), (std::vector<int>{1, 3, 384, 384}));
-  EXPECT_EQ(Shape(*stage0.output_blob()), (std::vector<int>{1, 2, 63, 63}));
-
-  Net<float> stage1(kStage1NetText, NetDescription::kText);
-  EXPECT_EQ(stage1.name(), "200.654");
-  ASSERT_EQ(stage1.layers().size(), 15u);
-  EXPECT_EQ(stage1.layer_names()[0], "input_data_0_split") << "data feeds two branches";
-  EXPECT_EQ(Shape(*stage1.output_blob()), (std::vector<int>{1, 2, 1, 1}));
-
-  Net<float> stage2(kStage2NetText, NetDescription::kText);
-  EXPECT_EQ(stage2.name(), "100.113");
-  ASSERT_EQ(stage2.layers().size(), 27u);
-  EXPECT_EQ(stage2.layer_names()[0], "input_data_0_split");
-  EXPECT_EQ(stage2.layer_names()[1], "x32-data");
-  EXPECT_EQ(stage2.layer_names()[2], "x32-data_x32-data_0_split");
-  EXPECT_EQ(Shape(*stage2.output_blob()), (std::vector<int>{1, 2, 1, 1}));
-
-  Net<float> calibration(kCalibrationNetText, NetDescription::kText);
-  EXPECT_EQ(calibration.name(), "200.79");
-  EXPECT_EQ(calibration.layers().size(), 7u);
-  EXPECT_EQ(Shape(*calibration.output_blob()), (std::vector<int>{1, 19, 1, 1}));
+  // Split layers are inserted where the data feeds two branches.
+  const struct { const char* text; const char* name; size_t layers; std::vector<int> input, output; } nets[] = {
+      {kStage0NetText, "900.175", 7, {1, 3, 384, 384}, {1, 2, 63, 63}},
+      {kStage1NetText, "200.654", 15, {1, 3, 24, 24}, {1, 2, 1, 1}},
+      {kStage2NetText, "100.113", 27, {1, 3, 48, 48}, {1, 2, 1, 1}},
+      {kCalibrationNetText, "200.79", 7, {1, 3, 24, 24}, {1, 19, 1, 1}}};
+  for (const auto& expected : nets) {
+    Net<float> net(expected.text, NetDescription::kText);
+    EXPECT_EQ(net.name(), expected.name);
+    EXPECT_EQ(net.layers().size(), expected.layers) << expected.name;
+    EXPECT_EQ(Shape(*net.net_input_blobs()[0]), expected.input) << expected.name;
+    EXPECT_EQ(Shape(*net.output_blob()), expected.output) << expected.name;
+  }
 }
 
 TEST(CascadeNetTextsTest, ScanNetRunsAtSmallerPyramidSizes) {
