@@ -3,7 +3,10 @@
 #include <gtest/gtest.h>
 
 #include <string>
+#include <vector>
 
+#include "detector/cascade_net_texts.h"
+#include "nn/net.h"
 #include "temp_dir.h"
 
 namespace tavilib {
@@ -41,6 +44,26 @@ TEST(CascadeFilesTest, OffsetsAreReadUntilTheFirstBadTriple) {
   EXPECT_EQ(table[2].scale, 1.0833f);
   EXPECT_EQ(readOffsetsScales(dir.write("bad", "1 1 1\n2 x 1\n3 3 1\n")).size(), 1u);
   EXPECT_TRUE(readOffsetsScales(dir.path() + "/missing").empty());
+}
+
+std::vector<int> Shape(const nn::Blob<float>& blob) {
+  return {blob.num(), blob.channels(), blob.height(), blob.width()};
+}
+
+TEST(CascadeNetTextsTest, EachDescriptionAssemblesIntoItsNet) {
+  // Split layers are inserted where the data feeds two branches.
+  const struct { const char* text; const char* name; size_t layers; std::vector<int> input, output; } nets[] = {
+      {kStage0NetText, "900.175", 7, {1, 3, 384, 384}, {1, 2, 63, 63}},
+      {kStage1NetText, "200.654", 15, {1, 3, 24, 24}, {1, 2, 1, 1}},
+      {kStage2NetText, "100.113", 27, {1, 3, 48, 48}, {1, 2, 1, 1}},
+      {kCalibrationNetText, "200.79", 7, {1, 3, 24, 24}, {1, 19, 1, 1}}};
+  for (const auto& expected : nets) {
+    nn::Net<float> net(expected.text, nn::NetDescription::kText);
+    EXPECT_EQ(net.name(), expected.name);
+    EXPECT_EQ(net.layers().size(), expected.layers) << expected.name;
+    EXPECT_EQ(Shape(*net.net_input_blobs()[0]), expected.input) << expected.name;
+    EXPECT_EQ(Shape(*net.output_blob()), expected.output) << expected.name;
+  }
 }
 
 }  // namespace

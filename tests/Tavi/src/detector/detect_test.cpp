@@ -1,10 +1,13 @@
 #include <gtest/gtest.h>
 
 #include <cmath>
+#include <filesystem>
 #include <limits>
 #include <stdexcept>
 #include <vector>
 
+#include "detector/detector_state.h"
+#include "nn/engine.h"
 #include "test_cascade.h"
 
 namespace tavilib {
@@ -17,20 +20,82 @@ const CascadeParameter kParams{1.0f, 400, 0.125f, 3, 1.5f, 12};
 
 // Loads the test folder's scan stage, a grader of face logit 3, a last stage
 // of 4 and a calibration net that always picks calibrationClass.
-void Load(Detector& detector, const TempDir& dir, const std::string& list, int calibrationClass) {
+Status Load(Detector& detector, const TempDir& dir, const std::string& list, int calibrationClass) {
   TestModelFolder folder(dir);
   folder.addScanStage("scan", 200);
   folder.addConstantStage("grade", {0.0f, 3.0f});
   folder.addConstantStage("final", {0.0f, 4.0f});
   folder.addCalibration(calibrationClass);
   folder.writeList(list);
-  ASSERT_EQ(detector.load(folder.params()), STATUS_OK);
+  return detector.load(folder.params());
+}
+
+TEST(DetectorLoadingTest, AFolderLoadsWithCommentsAndBuildsTheStagesInOrder) {
+  TempDir dir;
+  Detector detector;
+  ASSERT_EQ(Load(detector, dir, "# the scan first\nscan 0.5\n# then a grader\ngrade 0.8\n", 0), STATUS_OK);
+  EXPECT_EQ(nn::Engine::phase(), nn::Engine::TEST);
+  EXPECT_EQ(nn::Engine::mode(), nn::Engine::CPU);
+  const auto& state = *static_cast<const DetectorState*>(detector.getDetector());
+  ASSERT_EQ(state.stages.size(), 2u);
+  EXPECT_EQ(state.stages[0].threshold, 0.5f);
+  EXPECT_TRUE(state.stages[0].mean.empty()) << "the full form has no mean";
+  EXPECT_EQ(state.stages[1].threshold, 0.8f);
+  EXPECT_EQ(state.stages[1].mean.size(), 1728u);
+  EXPECT_EQ(state.calibration.offsetsScales.size(), 19u);
+  EXPECT_TRUE(state.ready);
+}
+
+// Lists naming no stage, and a second load that fails after a working one,
+// leave a state that refuses to detect.
+TEST(DetectorLoadingTest, MissingOrEmptyListsLeaveAFailedState) {
+  TempDir dir;
+  cv::Mat pixels = ImageWithPatch(100, 80, cv::Rect(10, 10, 20, 20));
+  std::vector<Detection> detections(1);
+  for (const char* list : {"", "# only comments\n# here\n", "scan 0.5"}) {
+    Detector detector;
+    EXPECT_EQ(Load(detector, dir, list, 0), STATUS_MODEL_LOAD_FAILED) << list;
+    EXPECT_TRUE(detector.is_loaded());
+    EXPECT_EQ(detect(AsImage(pixels), detector, detections, kParams), STATUS_DETECTOR_NOT_READY);
+    EXPECT_EQ(detections.size(), 1u);
+  }
+  Detector detector;
+  ASSERT_EQ(Load(detector, dir, "scan 0.5\n", 0), STATUS_OK);
+  ASSERT_EQ(detect(AsImage(pixels), detector, detections, kParams), STATUS_OK);
+  EXPECT_EQ(loadDetector(detector, DetectorParams()), STATUS_MODEL_LOAD_FAILED);
+  EXPECT_EQ(detect(AsImage(pixels), detector, detections, kParams), STATUS_DETECTOR_NOT_READY);
+  unloadDetector(detector);
+  EXPECT_FALSE(detector.is_loaded());
+}
+
+TEST(DetectorLoadingDeathTest, MissingOrEmptyNetFilesEndTheProcessNamingTheFile) {
+  TempDir dir;
+  TestModelFolder folder(dir);
+  folder.addScanStage("scan", 200);
+  folder.writeList("scan 0.5\n");
+  Detector detector;
+  EXPECT_DEATH(detector.load(folder.params()),
+               "File not found: .*/cascades/x32Net-x32-3Scales-200/+prototxt-deploy");
+  folder.addCalibration(0);
+  folder.writeList("scan 0.5\nnowhere 0.5\n");
+  EXPECT_DEATH(detector.load(folder.params()), "File not found: .*/nowhere/prototxt-deploy");
+
+  // An empty description, a folder in its place, or a list line cut by a NUL
+  // byte (naming the model folder itself) give a net without input.
+  folder.writeList("scan 0.5\n");
+  dir.write(kCalibrationFolder + "/prototxt-deploy", "");
+  EXPECT_DEATH(detector.load(folder.params()), "x32Net-x32-3Scales-200/+prototxt-deploy");
+  std::filesystem::create_directories(dir.path() + "/folder/prototxt-full");
+  folder.writeList("folder 0.5\n");
+  EXPECT_DEATH(detector.load(folder.params()), "/folder/prototxt-full");
+  folder.writeList(std::string("folder\0/scan 0.5\n", 17));
+  EXPECT_DEATH(detector.load(folder.params()), "/folder");
 }
 
 TEST(DetectTest, FindsABrightPatchThroughAnyStrideAndAppends) {
   TempDir dir;
   Detector detector;
-  Load(detector, dir, "scan 0.5\n", 0);
+  ASSERT_EQ(Load(detector, dir, "scan 0.5\n", 0), STATUS_OK);
   const cv::Rect patch(200, 100, 60, 60);
   cv::Mat pixels = ImageWithPatch(400, 300, patch);
   std::vector<Detection> detections;
@@ -77,7 +142,7 @@ TEST(DetectTest, ThreeStagesCalibrateTheMiddleOne) {
   for (int calibrationClass : {0, 4}) {
     TempDir dir;
     Detector detector;
-    Load(detector, dir, "scan 0.5\ngrade 0.8\nfinal 0.9\n", calibrationClass);
+    ASSERT_EQ(Load(detector, dir, "scan 0.5\ngrade 0.8\nfinal 0.9\n", calibrationClass), STATUS_OK);
     ASSERT_EQ(detect(AsImage(pixels), detector, found[calibrationClass / 4], oneLevel), STATUS_OK);
   }
   const std::vector<Detection>& unmoved = found[0];
@@ -96,7 +161,7 @@ TEST(DetectTest, ThreeStagesCalibrateTheMiddleOne) {
 TEST(DetectTest, ImagesStridesAndScanSettingsOutsideTheContractAreRefused) {
   TempDir dir;
   Detector detector;
-  Load(detector, dir, "scan 0.5\n", 0);
+  ASSERT_EQ(Load(detector, dir, "scan 0.5\n", 0), STATUS_OK);
   cv::Mat pixels = ImageWithPatch(400, 300, cv::Rect(100, 100, 60, 60));
   std::vector<Detection> detections(1);
   EXPECT_THROW(detect(Image{40, 30, 0, nullptr}, detector, detections, kParams), cv::Exception);

@@ -88,7 +88,8 @@ class TestModelFolder {
 
   void addCalibration(int favouredClass) {
     addConstantStage(kCalibrationFolder, Favour(favouredClass));
-    std::filesystem::copy_file(kShippedOffsets, dir_.path() + "/" + kCalibrationFolder + "/offsets-scales");
+    std::filesystem::copy_file(kShippedOffsets, dir_.path() + "/" + kCalibrationFolder + "/offsets-scales",
+                               std::filesystem::copy_options::overwrite_existing);
   }
 
   void writeList(const std::string& contents) { dir_.write("cascade.list", contents); }
