@@ -1,5 +1,10 @@
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <cstdio>
+#include <cstring>
+#include <memory>
+#include <string>
 #include <vector>
 
 #include "tavilib.h"
@@ -52,6 +57,37 @@ TEST(DetectorTest, FailedLoadLeavesAStateThatRefusesToDetectAndCopiesShareIt) {
   EXPECT_FALSE(copy.is_loaded());
   EXPECT_EQ(copy.getDetector(), nullptr);
   detector = Detector();
+}
+
+// What libtavi.so defines in its dynamic table, demangled.
+TEST(ExportedSymbolsTest, OnlyTheTavilibInterfaceLeavesTheLibrary) {
+  const std::string command = std::string("nm -D --defined-only -C ") + TAVI_LIBRARY_PATH + " | cut -d' ' -f3-";
+  std::unique_ptr<FILE, int (*)(FILE*)> pipe(popen(command.c_str(), "r"), pclose);
+  ASSERT_NE(pipe, nullptr);
+  std::vector<std::string> names;
+  for (char line[4096]; std::fgets(line, sizeof line, pipe.get());) {
+    names.emplace_back(line, std::strcspn(line, "\n"));
+    EXPECT_THAT(names.back(), testing::StartsWith("tavilib::"));
+  }
+  ASSERT_FALSE(names.empty());
+  for (const char* entry : {
+           "tavilib::detect(tavilib::Image const&, tavilib::Detector const&, "
+           "std::vector<tavilib::Detection",
+           "tavilib::loadDetector(tavilib::Detector&)",
+           "tavilib::loadDetector(tavilib::Detector&, tavilib::DetectorParams const&)",
+           "tavilib::unloadDetector(tavilib::Detector&)", "tavilib::Detector::load()",
+           "tavilib::Detector::operator=(tavilib::Detector const&)",
+           "tavilib::Detector::getDetector() const",
+           "tavilib::DetectorParams::DetectorParams(char const* const&, char const* const&)",
+           "tavilib::scanSettingsFor(tavilib::Detector const&, int, int, int, tavilib::ScanSettings&)",
+           "tavilib::checkDetectorModel(tavilib::DetectorParams const&, std::",
+           "tavilib::checkSDMModel(std::", "tavilib::loadSDMModel(std::", "tavilib::unloadSDMModel()",
+           "tavilib::align68Points(tavilib::Image const&, tavilib::Rectangle<float> const&, "
+           "std::vector<float",
+           "tavilib::align5Points(tavilib::Image const&, tavilib::Rectangle<float> const&, "
+           "std::vector<float"}) {
+    EXPECT_THAT(names, testing::Contains(testing::StartsWith(entry)));
+  }
 }
 
 }  // namespace

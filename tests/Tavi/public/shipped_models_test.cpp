@@ -9,6 +9,7 @@
 #include <sstream>
 #include <stdexcept>
 #include <string>
+#include <thread>
 #include <vector>
 
 #include "tavilib.h"
@@ -59,6 +60,16 @@ std::vector<Detection> Detect(const Detector& detector, const cv::Mat& image) {
   return detections;
 }
 
+void ExpectSameFaces(const std::vector<Detection>& found, const std::vector<Detection>& expected) {
+  ASSERT_EQ(found.size(), expected.size());
+  for (size_t i = 0; i < found.size(); ++i) {
+    const Rectangle<float>& a = found[i].box;
+    const Rectangle<float>& b = expected[i].box;
+    EXPECT_EQ((std::vector<float>{a.left, a.top, a.right, a.bottom, found[i].score}),
+              (std::vector<float>{b.left, b.top, b.right, b.bottom, expected[i].score})) << i;
+  }
+}
+
 // The shipped folder and the built-in cascade (which finds its weights at
 // "../../../Tavi/public/cascades/...", so it is loaded from three folders
 // below a folder linking to the project's) find the same faces.
@@ -78,14 +89,7 @@ class ShippedModelsTest : public testing::Test {
 
   std::vector<Detection> DetectWithBoth(const cv::Mat& image) {
     const std::vector<Detection> faces = Detect(fromFolder_, image);
-    const std::vector<Detection> same = Detect(builtIn_, image);
-    EXPECT_EQ(faces.size(), same.size());
-    for (size_t i = 0; i < std::min(faces.size(), same.size()); ++i) {
-      const Rectangle<float>& a = faces[i].box;
-      const Rectangle<float>& b = same[i].box;
-      EXPECT_EQ((std::vector<float>{a.left, a.top, a.right, a.bottom, faces[i].score}),
-                (std::vector<float>{b.left, b.top, b.right, b.bottom, same[i].score})) << i;
-    }
+    ExpectSameFaces(Detect(builtIn_, image), faces);
     return faces;
   }
 
@@ -147,6 +151,38 @@ TEST_F(ShippedModelsTest, FindAndPlaceTheHeldOutFaces) {
     EXPECT_LT(error / 68.0f / eyes, 0.12f);
   }
   unloadSDMModel();
+}
+
+// Threads that each load a detector and detect, beside threads aligning on
+// the one landmark model, all get what one thread alone gets.
+TEST(ConcurrencyTest, LoadsDetectionsAndAlignmentsOnManyThreadsAgreeWithOneThread) {
+  const cv::Mat photo = cv::imread(TAVI_SOURCE_DIR "/samples/astronaut.png");
+  const auto loadAndDetect = [&photo] {
+    Detector detector;
+    EXPECT_EQ(detector.load(DetectorParams(kModelRoot, "cascade.list")), STATUS_OK);
+    return Detect(detector, photo);
+  };
+  const std::vector<Detection> expected = loadAndDetect();
+  ASSERT_FALSE(expected.empty());
+  ASSERT_EQ(loadSDMModel(kModelRoot, "landmarks.sdm"), STATUS_OK);
+  const Image image{photo.cols, photo.rows, 0, photo.data};
+  std::vector<float> expectedPoints;
+  ASSERT_EQ(align68Points(image, expected[0].box, expectedPoints), STATUS_OK);
+
+  constexpr int kEach = 3;
+  std::vector<std::vector<Detection>> found(kEach);
+  std::vector<std::vector<float>> points(kEach);
+  std::vector<std::thread> threads;
+  for (int t = 0; t < kEach; ++t) {
+    threads.emplace_back([&, t] { found[t] = loadAndDetect(); });
+    threads.emplace_back([&, t] { align68Points(image, expected[0].box, points[t]); });
+  }
+  for (std::thread& thread : threads) thread.join();
+  unloadSDMModel();
+  for (int t = 0; t < kEach; ++t) {
+    ExpectSameFaces(found[t], expected);
+    EXPECT_EQ(points[t], expectedPoints) << t;
+  }
 }
 
 }  // namespace
