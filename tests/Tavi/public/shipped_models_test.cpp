@@ -32,19 +32,14 @@ struct Frame {
 std::vector<Frame> ValidationFrames(int count) {
   std::vector<Frame> frames;
   std::ifstream csv(kValidationCsv);
-  std::string line;
-  std::getline(csv, line);
-  while (static_cast<int>(frames.size()) < count && std::getline(csv, line)) {
+  csv.ignore(1 << 20, '\n');
+  for (std::string line; static_cast<int>(frames.size()) < count && std::getline(csv, line);) {
     std::stringstream fields(line);
-    std::string file;
-    std::string person;
+    std::string file, value;
     std::getline(fields, file, ',');
-    std::getline(fields, person, ',');
-    Frame frame{cv::imread(fs::path(kValidationCsv).parent_path() / file), {}};
-    for (std::string value; std::getline(fields, value, ',');) {
-      frame.points.push_back(std::stof(value));
-    }
-    frames.push_back(std::move(frame));
+    std::getline(fields, value, ',');  // the person
+    frames.push_back({cv::imread(fs::path(kValidationCsv).parent_path() / file), {}});
+    while (std::getline(fields, value, ',')) frames.back().points.push_back(std::stof(value));
   }
   return frames;
 }
@@ -155,31 +150,28 @@ TEST_F(ShippedModelsTest, FindAndPlaceTheHeldOutFaces) {
 
 // Threads that each load a detector and detect, beside threads aligning on
 // the one landmark model, all get what one thread alone gets.
-TEST(ConcurrencyTest, LoadsDetectionsAndAlignmentsOnManyThreadsAgreeWithOneThread) {
+TEST_F(ShippedModelsTest, LoadsDetectionsAndAlignmentsOnManyThreadsAgreeWithOneThread) {
   const cv::Mat photo = cv::imread(TAVI_SOURCE_DIR "/samples/astronaut.png");
-  const auto loadAndDetect = [&photo] {
-    Detector detector;
-    EXPECT_EQ(detector.load(DetectorParams(kModelRoot, "cascade.list")), STATUS_OK);
-    return Detect(detector, photo);
-  };
-  const std::vector<Detection> expected = loadAndDetect();
+  const std::vector<Detection> expected = Detect(fromFolder_, photo);
   ASSERT_FALSE(expected.empty());
   ASSERT_EQ(loadSDMModel(kModelRoot, "landmarks.sdm"), STATUS_OK);
   const Image image{photo.cols, photo.rows, 0, photo.data};
   std::vector<float> expectedPoints;
   ASSERT_EQ(align68Points(image, expected[0].box, expectedPoints), STATUS_OK);
-
-  constexpr int kEach = 3;
-  std::vector<std::vector<Detection>> found(kEach);
-  std::vector<std::vector<float>> points(kEach);
+  std::vector<std::vector<Detection>> found(3);
+  std::vector<std::vector<float>> points(3);
   std::vector<std::thread> threads;
-  for (int t = 0; t < kEach; ++t) {
-    threads.emplace_back([&, t] { found[t] = loadAndDetect(); });
+  for (size_t t = 0; t < 3; ++t) {
+    threads.emplace_back([&, t] {
+      Detector detector;
+      EXPECT_EQ(detector.load(DetectorParams(kModelRoot, "cascade.list")), STATUS_OK);
+      found[t] = Detect(detector, photo);
+    });
     threads.emplace_back([&, t] { align68Points(image, expected[0].box, points[t]); });
   }
   for (std::thread& thread : threads) thread.join();
   unloadSDMModel();
-  for (int t = 0; t < kEach; ++t) {
+  for (size_t t = 0; t < 3; ++t) {
     ExpectSameFaces(found[t], expected);
     EXPECT_EQ(points[t], expectedPoints) << t;
   }

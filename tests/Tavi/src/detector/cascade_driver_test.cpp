@@ -30,21 +30,21 @@ class FakeCascade {
   Status run(std::vector<Detection>& detections, int width, int height, int stride = 0) {
     std::vector<unsigned char> pixels(static_cast<size_t>(stride ? stride : width * 3) * height);
     CascadeSteps steps;
-    steps.scan = [this](const cv::Mat& image, const CascadeParameter&, CascadeStage& first) {
+    steps.scan = [this, width, height](const cv::Mat& image, const CascadeParameter&, CascadeStage& first) {
       EXPECT_EQ(&first, &state.stages[0]);
-      scannedSize = image.size();
-      log.emplace_back("scan", std::vector<Window>());
+      EXPECT_EQ(image.size(), cv::Size(width, height));
+      log("scan", {});
       return PyramidScan{scanWindows, baseScale};
     };
     steps.grade = [this](std::vector<Window> windows, CascadeStage& stage, const cv::Mat&) {
       const size_t s = static_cast<size_t>(&stage - state.stages.data());
-      log.emplace_back("grade" + std::to_string(s), windows);
+      log("grade" + std::to_string(s), windows);
       for (Window& w : windows) w.score = scoreAtStage[s][w.x];
       return windows;
     };
     steps.calibrate = [this](std::vector<Window> windows, CascadeStage& calibration, const cv::Mat&) {
       EXPECT_EQ(&calibration, &state.calibration);
-      log.emplace_back("calibrate", windows);
+      log("calibrate", windows);
       for (Window& w : windows) {
         if (calibratedX.count(w.x)) w.x = calibratedX[w.x];
       }
@@ -54,10 +54,9 @@ class FakeCascade {
     return runCascade(Image{width, height, stride, pixels.data()}, state, detections, params, steps);
   }
 
-  std::vector<std::string> callNames() const {
-    std::vector<std::string> names;
-    for (const auto& entry : log) names.push_back(entry.first);
-    return names;
+  void log(const std::string& call, const std::vector<Window>& windows) {
+    calls.push_back(call);
+    received.push_back(windows);
   }
 
   DetectorState state;
@@ -65,8 +64,8 @@ class FakeCascade {
   float baseScale = 1.0f;
   std::map<size_t, std::map<int, float>> scoreAtStage;
   std::map<int, int> calibratedX;
-  std::vector<std::pair<std::string, std::vector<Window>>> log;
-  cv::Size scannedSize;
+  std::vector<std::string> calls;
+  std::vector<std::vector<Window>> received;
 };
 
 TEST(CascadeDriverTest, OneStageScalesBackSortsThresholdsAndMergesFinally) {
@@ -75,7 +74,7 @@ TEST(CascadeDriverTest, OneStageScalesBackSortsThresholdsAndMergesFinally) {
   detections[0].score = -1.0f;
   cascade.state.ready = false;
   EXPECT_EQ(cascade.run(detections, 40, 30), STATUS_DETECTOR_NOT_READY);
-  EXPECT_TRUE(cascade.log.empty());
+  EXPECT_TRUE(cascade.calls.empty());
   cascade.state.ready = true;
 
   // The worked pyramid example: a base scale of 0.15 brings the last windows of
@@ -84,8 +83,7 @@ TEST(CascadeDriverTest, OneStageScalesBackSortsThresholdsAndMergesFinally) {
   cascade.scanWindows = {makeWindow(227, 167, 12, 0.5f), makeWindow(0, 0, 12, 0.4f),
                          makeWindow(30, 0, 12, 0.9f), makeWindow(31, 0, 12, 0.8f)};
   ASSERT_EQ(cascade.run(detections, 1600, 1200, 1600 * 3 + 7), STATUS_OK);
-  EXPECT_EQ(cascade.scannedSize, cv::Size(1600, 1200));
-  EXPECT_EQ(cascade.callNames(), (std::vector<std::string>{"scan"}));
+  EXPECT_EQ(cascade.calls, (std::vector<std::string>{"scan"}));
   // A second call appends its own list behind the first.
   cascade.scanWindows = {makeWindow(220, 160, 18, 0.45f)};
   ASSERT_EQ(cascade.run(detections, 1600, 1200), STATUS_OK);
@@ -114,7 +112,7 @@ TEST(CascadeDriverTest, LaterStagesGradeWhatPassedTheStageBeforeInScoreOrder) {
   cascade.scoreAtStage[1] = {{0, 0.7f}, {100, 0.95f}};
   std::vector<Detection> detections;
   ASSERT_EQ(cascade.run(detections, 400, 100), STATUS_OK);
-  const std::vector<Window>& graded = cascade.log[1].second;
+  const std::vector<Window>& graded = cascade.received[1];
   ASSERT_EQ(graded.size(), 2u);
   EXPECT_EQ(graded[0].x, 0);
   EXPECT_EQ(graded[1].x, 100);
@@ -132,7 +130,7 @@ TEST(CascadeDriverTest, LaterStagesGradeWhatPassedTheStageBeforeInScoreOrder) {
     for (size_t s = 1; s < stages; ++s) chain.scoreAtStage[s] = {{0, 0.5f}};
     detections.clear();
     ASSERT_EQ(chain.run(detections, 50, 50), STATUS_OK);
-    EXPECT_EQ(chain.callNames(), calls[stages - 2]);
+    EXPECT_EQ(chain.calls, calls[stages - 2]);
     EXPECT_EQ(detections.size(), 1u);
   }
 }
@@ -148,8 +146,8 @@ TEST(CascadeDriverTest, MiddleStageCalibratesAndMergesBeforeItsThreshold) {
   cascade.scoreAtStage[2] = {{1, 0.6f}};
   std::vector<Detection> detections;
   ASSERT_EQ(cascade.run(detections, 200, 100), STATUS_OK);
-  EXPECT_EQ(cascade.log[2].second.size(), 3u) << "calibration sees windows below the threshold";
-  const std::vector<Window>& lastGraded = cascade.log[3].second;
+  EXPECT_EQ(cascade.received[2].size(), 3u) << "calibration sees windows below the threshold";
+  const std::vector<Window>& lastGraded = cascade.received[3];
   ASSERT_EQ(lastGraded.size(), 1u) << "merged, then cut at 0.8";
   EXPECT_EQ(lastGraded[0].x, 1);
   EXPECT_EQ(lastGraded[0].score, 0.9f) << "scores from the grading stage survive calibration";
