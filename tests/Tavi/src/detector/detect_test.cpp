@@ -22,7 +22,7 @@ const CascadeParameter kParams{1.0f, 400, 0.125f, 3, 1.5f, 12};
 // of 4 and a calibration net that always picks calibrationClass.
 Status Load(Detector& detector, const TempDir& dir, const std::string& list, int calibrationClass) {
   TestModelFolder folder(dir);
-  folder.addScanStage("scan", 200);
+  folder.addScanStage("scan");
   folder.addConstantStage("grade", {0.0f, 3.0f});
   folder.addConstantStage("final", {0.0f, 4.0f});
   folder.addCalibration(calibrationClass);
@@ -55,7 +55,7 @@ TEST(DetectorLoadingTest, MissingOrEmptyListsLeaveAFailedState) {
 TEST(DetectorLoadingDeathTest, MissingOrEmptyNetFilesEndTheProcessNamingTheFile) {
   TempDir dir;
   TestModelFolder folder(dir);
-  folder.addScanStage("scan", 200);
+  folder.addScanStage("scan");
   folder.writeList("scan 0.5\n");
   Detector detector;
   EXPECT_DEATH(detector.load(folder.params()),

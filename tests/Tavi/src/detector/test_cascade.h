@@ -54,17 +54,15 @@ inline std::vector<float> Favour(int favoured) {
 // picks one class of the shipped table.
 class TestModelFolder {
  public:
-  explicit TestModelFolder(const TempDir& dir) : dir_(dir) {}
+  explicit TestModelFolder(const TempDir& dir) : dir_(dir), root_(dir.path() + "/") {}
 
   // One 12 x 12 convolution of stride 6 into two classes over a declared
-  // input of size x size. The face logit is 0.1 * (mean brightness + 100) -
+  // input of 200 x 200. The face logit is 0.1 * (mean brightness + 100) -
   // 22.8 once the stored response (the bias again) is added: a window is a
   // face when its mean is above 128.
-  void addScanStage(const std::string& name, int size) {
-    const std::string side = std::to_string(size);
+  void addScanStage(const std::string& name) {
     dir_.write(name + "/prototxt-full",
-               "name: 'bright' input: 'data' input_dim: 1 input_dim: 3 input_dim: " + side +
-                   " input_dim: " + side +
+               "name: 'bright' input: 'data' input_dim: 1 input_dim: 3 input_dim: 200 input_dim: 200"
                    " layers { name: 'conv' type: CONVOLUTION bottom: 'data' top: 'conv'"
                    "   convolution_param { num_output: 2 kernel_size: 12 stride: 6 } }"
                    " layers { name: 'probs' type: SOFTMAX bottom: 'conv' top: 'probs' }");
@@ -94,15 +92,11 @@ class TestModelFolder {
 
   void writeList(const std::string& contents) { dir_.write("cascade.list", contents); }
 
-  DetectorParams params() {
-    root_ = dir_.path() + "/";
-    return DetectorParams(root_.c_str(), list_);
-  }
+  DetectorParams params() const { return DetectorParams(root_.c_str(), "cascade.list"); }
 
  private:
   const TempDir& dir_;
-  std::string root_;
-  const char* list_ = "cascade.list";
+  const std::string root_;
 };
 
 // A black BGR image with a white rectangle.

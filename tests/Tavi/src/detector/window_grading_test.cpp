@@ -71,48 +71,41 @@ TEST(WindowGradingTest, TheNetSeesPlanesInByteOrderTwoOneZeroLessTheMean) {
   EXPECT_LT(gradeWindows({At(0, 0, 48)}, stage, image)[0].score, 0.01f);
 }
 
-cv::Rect Calibrate(CascadeStage& stage, const cv::Rect& r) {
+// Calibrates `in` on a 200 x 200 image with a net of fixed logits, against
+// the shipped table cut to `rows` rows and with row `row` replaced if given.
+cv::Rect Calibrate(const std::vector<float>& logits, const cv::Rect& in, size_t rows = 19,
+                   int row = -1, const OffsetScale& correction = {}) {
   static const cv::Mat image(200, 200, CV_8UC3, cv::Scalar::all(0));
-  const Window moved = calibrateWindows({Window{r.x, r.y, r.width, r.height, 0.7f, 3}}, stage, image)[0];
+  CascadeStage stage = ConstantStage(logits);
+  stage.offsetsScales.resize(rows);
+  if (row >= 0) stage.offsetsScales[row] = correction;
+  const Window moved = calibrateWindows({Window{in.x, in.y, in.width, in.height, 0.7f, 3}}, stage, image)[0];
   EXPECT_EQ(moved.score, 0.7f);
   return cv::Rect(moved.x, moved.y, moved.width, moved.height);
 }
 
-TEST(WindowGradingTest, CalibrationShiftsAndScalesByTheBestClassStrictlyInside) {
+TEST(WindowGradingTest, CalibrationMovesStrictlyInsideByAClaimOfOneInTenWithinTheTable) {
   // Class 4 is offset (4, 0): x moves left by trunc(4 / 24 * 48) = 8. Class 2
-  // (-4, 0) moves right. Class 9, (1, 1) at scale 11/12, enlarges 48 to 52.
+  // (-4, 0) moves right, but not onto the right edge. Class 9, (1, 1) at
+  // scale 11/12, enlarges 48 to 52.
   const struct { int favoured; cv::Rect in, out; } cases[] = {
       {4, {100, 50, 48, 48}, {92, 50, 48, 48}},  {4, {7, 50, 48, 48}, {7, 50, 48, 48}},
       {2, {143, 0, 48, 48}, {151, 0, 48, 48}},   {2, {144, 0, 48, 48}, {144, 0, 48, 48}},
       {9, {100, 100, 48, 48}, {98, 98, 52, 52}}, {0, {10, 10, 48, 48}, {10, 10, 48, 48}}};
   for (const auto& c : cases) {
-    CascadeStage stage = ConstantStage(Favour(c.favoured));
-    EXPECT_EQ(Calibrate(stage, c.in), c.out) << c.favoured << " " << c.in;
+    EXPECT_EQ(Calibrate(Favour(c.favoured), c.in), c.out) << c.favoured << " " << c.in;
   }
-}
-
-TEST(WindowGradingTest, CalibrationNeedsAClaimOfOneInTenWithinTheTable) {
+  // Ten equal classes claim one in ten each, and the first moves; nineteen
+  // claim too little. Class 4 lies beyond a table of four rows.
   const cv::Rect at(100, 100, 48, 48);
-  // Equal classes: ten claim one in ten each, and the first moves; nineteen
-  // claim too little.
-  for (int classes : {10, 19}) {
-    CascadeStage equal = ConstantStage(std::vector<float>(classes, 0.0f));
-    equal.offsetsScales[0] = OffsetScale{4, 0, 1.0f};
-    EXPECT_EQ(Calibrate(equal, at), classes == 10 ? cv::Rect(92, 100, 48, 48) : at) << classes;
-  }
-  // The favoured class 4 lies beyond a table of four rows.
-  CascadeStage shortTable = ConstantStage(Favour(4));
-  shortTable.offsetsScales.resize(4);
-  EXPECT_EQ(Calibrate(shortTable, at), at);
-
+  EXPECT_EQ(Calibrate(std::vector<float>(10, 0.0f), at, 19, 0, {4, 0, 1.0f}), cv::Rect(92, 100, 48, 48));
+  EXPECT_EQ(Calibrate(std::vector<float>(19, 0.0f), at, 19, 0, {4, 0, 1.0f}), at);
+  EXPECT_EQ(Calibrate(Favour(4), at, 4), at);
   // Corrections no integer holds (a scale of 0 or a tiny one, offsets near
   // 2^31) cannot land inside the image: the window stays, whole.
   for (const OffsetScale& wild : {OffsetScale{0, 0, 0.0f}, OffsetScale{0, 0, 1e-30f},
-                                  OffsetScale{2000000000, 0, 1.0f},
-                                  OffsetScale{0, -2147483647, 1.0f}}) {
-    CascadeStage table = ConstantStage(Favour(4));
-    table.offsetsScales[4] = wild;
-    EXPECT_EQ(Calibrate(table, at), at);
+                                  OffsetScale{2000000000, 0, 1.0f}, OffsetScale{0, -2147483647, 1.0f}}) {
+    EXPECT_EQ(Calibrate(Favour(4), at, 19, 4, wild), at);
   }
 }
 
