@@ -104,8 +104,8 @@ TEST(CascadeDriverTest, OneStageScalesBackSortsThresholdsAndMergesFinally) {
 
 TEST(CascadeDriverTest, LaterStagesGradeWhatPassedTheStageBeforeInScoreOrder) {
   FakeCascade cascade({0.5f, 0.7f});
-  cascade.scanWindows = {makeWindow(0, 0, 10, 0.6f), makeWindow(100, 0, 10, 0.55f),
-                         makeWindow(200, 0, 10, 0.5f)};
+  cascade.scanWindows = {makeWindow(100, 0, 10, 0.55f), makeWindow(200, 0, 10, 0.5f),
+                         makeWindow(0, 0, 10, 0.6f)};
   cascade.scoreAtStage[1] = {{0, 0.7f}, {100, 0.95f}};
   std::vector<Detection> detections;
   ASSERT_EQ(cascade.run(detections, 400, 100), STATUS_OK);

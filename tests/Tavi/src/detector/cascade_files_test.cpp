@@ -12,7 +12,7 @@
 namespace tavilib {
 namespace {
 
-TEST(CascadeFilesTest, ListLinesNeedTheirNewline) {
+TEST(CascadeFilesTest, ListLinesAndMeanNumbersNeedWhatFollowsThem) {
   TempDir dir;
   const std::vector<CascadeListEntry> entries = readCascadeList(
       dir.write("list", "# stages\nx16 0.4 trailing words\n#x32 0.8\n\nx64 0.98\nlast 0.5"));
@@ -23,10 +23,8 @@ TEST(CascadeFilesTest, ListLinesNeedTheirNewline) {
   EXPECT_EQ(entries[2].folder, "x64");
   EXPECT_EQ(entries[2].threshold, 0.98f);
   EXPECT_TRUE(readCascadeList(dir.path() + "/missing").empty());
-}
 
-TEST(CascadeFilesTest, MeanFilesNeedWhiteSpaceAfterTheLastNumber) {
-  TempDir dir;
+  // A mean file needs white space after its last number.
   EXPECT_EQ(readMeanFile(dir.write("a", "1.5 2\n3\t4 \n")), (std::vector<float>{1.5f, 2, 3, 4}));
   EXPECT_EQ(readMeanFile(dir.write("b", "1.5 2 3")), (std::vector<float>{1.5f, 2}));
   EXPECT_EQ(readMeanFile(dir.write("c", "1 2 x 3\n")), (std::vector<float>{1, 2}));

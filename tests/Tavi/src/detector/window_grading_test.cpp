@@ -30,7 +30,7 @@ CascadeStage ConstantStage(const std::vector<float>& logits, nn::NetParameter we
 
 Window At(int x, int y, int side) { return Window{x, y, side, side, 0.7f, 3}; }
 
-TEST(WindowGradingTest, GradingReplacesScoresAndKeepsTheList) {
+TEST(WindowGradingTest, GradingReplacesScoresWithTheFaceClassOfPlanesLessTheMean) {
   CascadeStage stage = ConstantStage({0.0f, 2.0f});
   const cv::Mat image(100, 120, CV_8UC3, cv::Scalar::all(50));
   const std::vector<Window> graded = gradeWindows({At(0, 0, 30), At(70, 40, 50)}, stage, image);
@@ -48,9 +48,8 @@ TEST(WindowGradingTest, GradingReplacesScoresAndKeepsTheList) {
 
   EXPECT_THROW(gradeWindows({At(90, 0, 40)}, stage, image), cv::Exception)
       << "a window that leaves the image";
-}
 
-TEST(WindowGradingTest, TheNetSeesPlanesInByteOrderTwoOneZeroLessTheMean) {
+  // The net sees planes of the third, second and first byte, less the mean.
   const cv::Mat pixels = (cv::Mat_<cv::Vec3b>(1, 2) << cv::Vec3b(1, 2, 3), cv::Vec3b(4, 5, 6));
   std::vector<float> planes(6);
   writeImagePlanes(pixels, planes.data(), 6);
@@ -62,13 +61,13 @@ TEST(WindowGradingTest, TheNetSeesPlanesInByteOrderTwoOneZeroLessTheMean) {
   for (int i = 0; i < 576; ++i) {
     weights.mutable_layers(0)->mutable_blobs(0)->set_data(1728 + i, 0.05f / 576.0f);
   }
-  CascadeStage stage = ConstantStage({0.0f, 0.0f}, weights);
-  stage.mean.assign(1728, 0.0f);
-  std::fill(stage.mean.begin(), stage.mean.begin() + 576, 200.0f);
-  cv::Mat image(48, 48, CV_8UC3, cv::Scalar(0, 0, 200));
-  EXPECT_NEAR(gradeWindows({At(0, 0, 48)}, stage, image)[0].score, 0.5f, 1e-6);
-  image.setTo(cv::Scalar(200, 0, 0));
-  EXPECT_LT(gradeWindows({At(0, 0, 48)}, stage, image)[0].score, 0.01f);
+  CascadeStage planeZero = ConstantStage({0.0f, 0.0f}, weights);
+  planeZero.mean.assign(1728, 0.0f);
+  std::fill(planeZero.mean.begin(), planeZero.mean.begin() + 576, 200.0f);
+  cv::Mat square(48, 48, CV_8UC3, cv::Scalar(0, 0, 200));
+  EXPECT_NEAR(gradeWindows({At(0, 0, 48)}, planeZero, square)[0].score, 0.5f, 1e-6);
+  square.setTo(cv::Scalar(200, 0, 0));
+  EXPECT_LT(gradeWindows({At(0, 0, 48)}, planeZero, square)[0].score, 0.01f);
 }
 
 // Calibrates `in` on a 200 x 200 image with a net of fixed logits, against
