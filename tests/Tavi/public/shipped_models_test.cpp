@@ -50,8 +50,7 @@ std::vector<Detection> Detect(const Detector& detector, const cv::Mat& image) {
   const int longEdge = std::max(image.cols, image.rows);
   const CascadeParameter scan{1.0f, longEdge, 30.5f / static_cast<float>(longEdge), 30, 1.2f, 12};
   std::vector<Detection> detections;
-  Image wrapped{image.cols, image.rows, static_cast<int32_t>(image.step), image.data};
-  EXPECT_EQ(detect(wrapped, detector, detections, scan), STATUS_OK);
+  EXPECT_EQ(detect(Image{image.cols, image.rows, 0, image.data}, detector, detections, scan), STATUS_OK);
   return detections;
 }
 
@@ -134,9 +133,9 @@ TEST_F(ShippedModelsTest, FindAndPlaceTheHeldOutFaces) {
         return x > face.box.left && x < face.box.right && y > face.box.top && y < face.box.bottom;
       });
     }));
-    Image wrapped{frame.pixels.cols, frame.pixels.rows, 0, frame.pixels.data};
     std::vector<float> points;
-    ASSERT_EQ(align68Points(wrapped, faces[0].box, points), STATUS_OK);
+    const Image image{frame.pixels.cols, frame.pixels.rows, 0, frame.pixels.data};
+    ASSERT_EQ(align68Points(image, faces[0].box, points), STATUS_OK);
     ASSERT_EQ(points.size(), 136u);
     const float eyes = std::hypot(frame.points[72] - frame.points[90], frame.points[73] - frame.points[91]);
     float error = 0.0f;

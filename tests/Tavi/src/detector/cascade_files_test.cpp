@@ -12,7 +12,7 @@
 namespace tavilib {
 namespace {
 
-TEST(CascadeFilesTest, ListLinesAndMeanNumbersNeedWhatFollowsThem) {
+TEST(CascadeFilesTest, ListsMeansAndOffsetsAreReadAsFarAsTheirEndsAllow) {
   TempDir dir;
   const std::vector<CascadeListEntry> entries = readCascadeList(
       dir.write("list", "# stages\nx16 0.4 trailing words\n#x32 0.8\n\nx64 0.98\nlast 0.5"));
@@ -29,10 +29,8 @@ TEST(CascadeFilesTest, ListLinesAndMeanNumbersNeedWhatFollowsThem) {
   EXPECT_EQ(readMeanFile(dir.write("b", "1.5 2 3")), (std::vector<float>{1.5f, 2}));
   EXPECT_EQ(readMeanFile(dir.write("c", "1 2 x 3\n")), (std::vector<float>{1, 2}));
   EXPECT_TRUE(readMeanFile(dir.path() + "/missing").empty());
-}
 
-TEST(CascadeFilesTest, OffsetsAreReadUntilTheFirstBadTriple) {
-  TempDir dir;
+  // Offsets are read until the first bad triple.
   const std::vector<OffsetScale> table =
       readOffsetsScales(dir.write("offsets", "0 0 1\n-4 4 0.9166666666666666\n5 5 1.0833"));
   ASSERT_EQ(table.size(), 3u) << "a last number at the end of the file counts";
@@ -50,7 +48,7 @@ std::vector<int> Shape(const nn::Blob<float>& blob) {
 
 TEST(CascadeNetTextsTest, EachDescriptionAssemblesIntoItsNet) {
   // Split layers are inserted where the data feeds two branches.
-  const struct { const char* text; const char* name; size_t layers; std::vector<int> input, output; } nets[] = {
+  const struct { const char *text, *name; size_t layers; std::vector<int> input, output; } nets[] = {
       {kStage0NetText, "900.175", 7, {1, 3, 384, 384}, {1, 2, 63, 63}},
       {kStage1NetText, "200.654", 15, {1, 3, 24, 24}, {1, 2, 1, 1}},
       {kStage2NetText, "100.113", 27, {1, 3, 48, 48}, {1, 2, 1, 1}},

@@ -101,9 +101,9 @@ TEST(DetectTest, FindsABrightPatchThroughAnyStrideAppendsAndRefusesWhatIsOutside
   ASSERT_EQ(detect(Image{400, 300, 400 * 3 + 13, padded.data}, detector, detections, kParams), STATUS_OK);
   ASSERT_EQ(detections.size(), 2 * first);
   for (size_t i = 0; i < first; ++i) {
-    EXPECT_EQ(detections[first + i].box.left, detections[i].box.left);
-    EXPECT_EQ(detections[first + i].box.top, detections[i].box.top);
-    EXPECT_EQ(detections[first + i].score, detections[i].score);
+    const Detection& a = detections[i];
+    const Detection& b = detections[first + i];
+    EXPECT_TRUE(a.box.left == b.box.left && a.box.top == b.box.top && a.score == b.score) << i;
   }
 
   // Images, strides and scan settings a host can get wrong are refused before
@@ -128,14 +128,6 @@ TEST(DetectTest, FindsABrightPatchThroughAnyStrideAppendsAndRefusesWhatIsOutside
         << params.normalizedSize << " " << params.minFaceRatio << " " << params.scaleStep;
   }
   EXPECT_EQ(detections.size(), 2 * first);
-
-  cv::Mat dark = ImageWithPatch(400, 300, cv::Rect(0, 0, 0, 0));
-  std::vector<Detection> none;
-  EXPECT_EQ(detect(AsImage(dark), detector, none, kParams), STATUS_OK);
-  CascadeParameter noLevels = kParams;
-  noLevels.numScales = 0;
-  EXPECT_EQ(detect(AsImage(pixels), detector, none, noLevels), STATUS_OK);
-  EXPECT_TRUE(none.empty());
 }
 
 TEST(DetectTest, AFolderLoadsItsStagesInOrderAndCalibratesTheMiddleOne) {

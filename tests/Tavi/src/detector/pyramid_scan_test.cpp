@@ -107,8 +107,8 @@ TEST(PyramidScanTest, TheWorkedExampleGivesItsGeometryMapsAndLastWindowsAndEndsO
     ASSERT_TRUE(window.score >= 0.0f && window.score <= 1.0f);
   }
 
-  // The scan ends at the first level that fails a size test. Levels 3 to 5 are 71x53, 47x35 and 31x23; level 6 (21x15) maps to one
-  // row of cells and ends the scan.
+  // The scan ends at the first level that fails a size test. Levels 3 to 5
+  // are 71x53, 47x35 and 31x23; level 6 (21x15) maps to one row of cells.
   CascadeParameter params = Params(320, 1.0f, 0.05f);
   params.numScales = 10;
   EXPECT_EQ(Levels(scanPyramid(image, params, stage)).size(), 6u);

@@ -12,12 +12,6 @@ Window W(int x, int y, int width, int height, float score) {
   return Window{x, y, width, height, score, 0};
 }
 
-std::vector<float> scoresOf(const std::vector<Window>& windows) {
-  std::vector<float> scores;
-  for (const Window& w : windows) scores.push_back(w.score);
-  return scores;
-}
-
 // Per size, windows of one width suppress each other above 0.5 of their
 // union; finally, any two suppress each other above 0.25 of the smaller area.
 TEST(WindowFilterTest, MergesKeepTheBetterOfTwoWindowsOverlappingBeyondTheirLimit) {
@@ -53,7 +47,10 @@ TEST(WindowFilterTest, PerSizeMergeGroupsByWidthInOrderOfFirstAppearance) {
       W(1, 0, 10, 10, 0.7f),   // width 10, over the first: suppresses it
       W(0, 0, 20, 10, -0.1f),  // below the score limit of 0
   };
-  EXPECT_EQ(scoresOf(mergePerSize(windows)), (std::vector<float>{0.8f, 0.7f, 0.95f}))
+  const std::vector<Window> merged = mergePerSize(windows);
+  ASSERT_EQ(merged.size(), 3u);
+  EXPECT_EQ((std::vector<float>{merged[0].score, merged[1].score, merged[2].score}),
+            (std::vector<float>{0.8f, 0.7f, 0.95f}))
       << "groups are not interleaved by score, and other widths do not suppress";
 }
 
