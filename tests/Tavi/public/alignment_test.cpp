@@ -28,41 +28,16 @@ std::string GridModel() {
   return bytes;
 }
 
-class AlignmentTest : public testing::Test {
- protected:
-  void TearDown() override { unloadSDMModel(); }
-  TempDir dir_;
-};
-
-TEST_F(AlignmentTest, StatusCodes) {
+TEST(AlignmentTest, PointsInImagePixelsAndStatusCodes) {
   // The path is folder, "/" and file.
-  dir_.write("sub/model.sdm", GridModel());
-  EXPECT_EQ(loadSDMModel(dir_.path() + "/sub", "model.sdm"), STATUS_OK);
-  std::vector<uint8_t> pixels(120 * 100 * 3, 90);
-  const Image image{120, 100, 0, pixels.data()};
-  const Rectangle<float> rect{20, 20, 80, 80};
-  std::vector<float> points;
-  EXPECT_EQ(align68Points(image, rect, points), STATUS_OK);
-  // A failed load drops the earlier model. Alignment on the blank record it
-  // leaves, or on none at all, gives no points rather than reading past an
-  // empty shape.
-  EXPECT_EQ(loadSDMModel(dir_.path(), "nothing.sdm"), STATUS_MODEL_LOAD_FAILED);
-  EXPECT_EQ(align68Points(image, rect, points), STATUS_MODEL_LOAD_FAILED);
-  EXPECT_TRUE(points.empty());
-  EXPECT_EQ(unloadSDMModel(), STATUS_OK);
-  EXPECT_EQ(unloadSDMModel(), STATUS_OK);
-  points.assign(3, 1.0f);
-  EXPECT_EQ(align5Points(image, rect, points), STATUS_MODEL_LOAD_FAILED);
-  EXPECT_TRUE(points.empty());
-}
-
-TEST_F(AlignmentTest, PointsInImagePixels) {
-  dir_.write("grid.sdm", GridModel());
-  ASSERT_EQ(loadSDMModel(dir_.path(), "grid.sdm"), STATUS_OK);
+  TempDir dir;
+  dir.write("sub/grid.sdm", GridModel());
+  ASSERT_EQ(loadSDMModel(dir.path() + "/sub", "grid.sdm"), STATUS_OK);
   std::vector<uint8_t> bytes(640 * 480 * 3, 90);
+  const Image image{640, 480, 0, bytes.data()};
   const Rectangle<float> rect{250.0f, 150.0f, 390.0f, 310.0f};
   std::vector<float> points(500, -1.0f);
-  EXPECT_EQ(align68Points(Image{640, 480, 0, bytes.data()}, rect, points), STATUS_OK);
+  EXPECT_EQ(align68Points(image, rect, points), STATUS_OK);
   ASSERT_EQ(points.size(), 136u);
   // The crop is 280 by 320 pixels from (180, 70), the working frame 250 by
   // 250; there the rectangle is (62.5, 62.5) to (187.5, 187.5) and the face
@@ -73,8 +48,19 @@ TEST_F(AlignmentTest, PointsInImagePixels) {
     EXPECT_NEAR(points[2 * k + 1], 70 + (80 + (0.1 + 0.09 * (k / 8)) * 162) * 320 / 250, 2.0) << k;
   }
   std::vector<float> five = {1, 2, 3};
-  EXPECT_EQ(align5Points(Image{640, 480, 0, bytes.data()}, rect, five), STATUS_OK);
+  EXPECT_EQ(align5Points(image, rect, five), STATUS_OK);
   EXPECT_EQ(five.size(), 10u);
+
+  // A failed load drops the earlier model. Alignment on the blank record it
+  // leaves, or on none at all, gives no points rather than reading past an
+  // empty shape.
+  EXPECT_EQ(loadSDMModel(dir.path(), "nothing.sdm"), STATUS_MODEL_LOAD_FAILED);
+  EXPECT_EQ(align68Points(image, rect, points), STATUS_MODEL_LOAD_FAILED);
+  EXPECT_TRUE(points.empty());
+  EXPECT_EQ(unloadSDMModel(), STATUS_OK);
+  EXPECT_EQ(unloadSDMModel(), STATUS_OK);
+  EXPECT_EQ(align5Points(image, rect, five), STATUS_MODEL_LOAD_FAILED);
+  EXPECT_TRUE(five.empty());
 }
 
 }  // namespace

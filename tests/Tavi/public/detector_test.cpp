@@ -1,5 +1,10 @@
+#include <gmock/gmock.h>
 #include <gtest/gtest.h>
 
+#include <cstdio>
+#include <cstring>
+#include <memory>
+#include <string>
 #include <vector>
 
 #include "tavilib.h"
@@ -7,65 +12,66 @@
 namespace tavilib {
 namespace {
 
-TEST(DetectorParamsTest, ConstructorsBorrowThePointersAndSetReserved) {
+TEST(DetectorTest, ParamsBorrowTheirPointersAndAFailedLoadLeavesAStateThatCopiesShare) {
   const DetectorParams empty;
   EXPECT_STREQ(empty.cascadeRoot, "");
   EXPECT_EQ(empty.cascadeRoot, empty.cascadeList) << "both point to one empty string";
-  EXPECT_EQ(empty.reserved, 1);
-
   const char* root = "models/";
-  const char* list = "cascade.list";
-  DetectorParams params(root, list);
+  const DetectorParams params(root, "cascade.list");
   EXPECT_EQ(params.cascadeRoot, root);
-  EXPECT_EQ(params.cascadeList, list);
+  EXPECT_EQ(empty.reserved, 1);
   EXPECT_EQ(params.reserved, 1);
 
-  params.reserved = 7;
-  DetectorParams copy(params);
-  EXPECT_EQ(copy.cascadeRoot, root);
-  EXPECT_EQ(copy.reserved, 7);
-  DetectorParams assigned;
-  assigned = params;
-  EXPECT_EQ(assigned.cascadeList, list);
-  EXPECT_EQ(assigned.reserved, 7);
-}
-
-TEST(DetectorTest, FailedLoadLeavesAStateThatRefusesToDetect) {
   Detector detector;
-  EXPECT_FALSE(detector.is_loaded());
   EXPECT_EQ(detector.getDetector(), nullptr);
-  detector.unload();  // harmless when empty
-  unloadDetector(detector);
-  EXPECT_FALSE(detector.is_loaded());
-
+  unloadDetector(detector);  // harmless when empty
   std::vector<unsigned char> pixels(30 * 20 * 3, 128);
-  const Image image{30, 20, 0, pixels.data()};
-  const CascadeParameter params{1.0f, 320, 0.1f, 3, 1.5f, 12};
+  const CascadeParameter scan{1.0f, 320, 0.1f, 3, 1.5f, 12};
   std::vector<Detection> detections(3);
-  EXPECT_EQ(detect(image, detector, detections, params), STATUS_DETECTOR_NOT_READY);
-
-  const DetectorParams nowhere;
-  EXPECT_EQ(loadDetector(detector, nowhere), STATUS_MODEL_LOAD_FAILED);
-  EXPECT_TRUE(detector.is_loaded());
-  EXPECT_NE(detector.getDetector(), nullptr);
-  EXPECT_EQ(detect(image, detector, detections, params), STATUS_DETECTOR_NOT_READY);
+  EXPECT_EQ(detect(Image{30, 20, 0, pixels.data()}, detector, detections, scan), STATUS_DETECTOR_NOT_READY);
   EXPECT_EQ(detections.size(), 3u);
-
-  detector.unload();
-  EXPECT_FALSE(detector.is_loaded());
-  EXPECT_EQ(detector.getDetector(), nullptr);
-}
-
-TEST(DetectorTest, AssignmentSharesTheStatePointer) {
-  Detector original;
-  original.load(DetectorParams());
+  // A failed load leaves a state, which copies share.
+  EXPECT_EQ(loadDetector(detector, empty), STATUS_MODEL_LOAD_FAILED);
+  EXPECT_TRUE(detector.is_loaded());
   Detector copy;
-  copy = original;
-  EXPECT_EQ(copy.getDetector(), original.getDetector());
+  copy = detector;
+  EXPECT_EQ(copy.getDetector(), detector.getDetector());
   // Each copy would delete the shared state: let only one of them do it.
   copy.unload();
-  Detector empty;
-  original = empty;
+  EXPECT_FALSE(copy.is_loaded());
+  EXPECT_EQ(copy.getDetector(), nullptr);
+  detector = Detector();
+}
+
+// What libtavi.so defines in its dynamic table, demangled.
+TEST(ExportedSymbolsTest, OnlyTheTavilibInterfaceLeavesTheLibrary) {
+  const std::string command = std::string("nm -D --defined-only -C ") + TAVI_LIBRARY_PATH + "|cut -d' ' -f3-";
+  std::unique_ptr<FILE, int (*)(FILE*)> pipe(popen(command.c_str(), "r"), pclose);
+  ASSERT_NE(pipe, nullptr);
+  std::vector<std::string> names;
+  for (char line[4096]; std::fgets(line, sizeof line, pipe.get());) {
+    names.emplace_back(line, std::strcspn(line, "\n"));
+    EXPECT_THAT(names.back(), testing::StartsWith("tavilib::"));
+  }
+  ASSERT_FALSE(names.empty());
+  for (const char* entry : {
+           "tavilib::detect(tavilib::Image const&, tavilib::Detector const&, "
+           "std::vector<tavilib::Detection",
+           "tavilib::loadDetector(tavilib::Detector&)",
+           "tavilib::loadDetector(tavilib::Detector&, tavilib::DetectorParams const&)",
+           "tavilib::unloadDetector(tavilib::Detector&)", "tavilib::Detector::load()",
+           "tavilib::Detector::operator=(tavilib::Detector const&)",
+           "tavilib::Detector::getDetector() const",
+           "tavilib::DetectorParams::DetectorParams(char const* const&, char const* const&)",
+           "tavilib::scanSettingsFor(tavilib::Detector const&, int, int, int, tavilib::ScanSettings&)",
+           "tavilib::checkDetectorModel(tavilib::DetectorParams const&, std::",
+           "tavilib::checkSDMModel(std::", "tavilib::loadSDMModel(std::", "tavilib::unloadSDMModel()",
+           "tavilib::align68Points(tavilib::Image const&, tavilib::Rectangle<float> const&, "
+           "std::vector<float",
+           "tavilib::align5Points(tavilib::Image const&, tavilib::Rectangle<float> const&, "
+           "std::vector<float"}) {
+    EXPECT_THAT(names, testing::Contains(testing::StartsWith(entry)));
+  }
 }
 
 }  // namespace

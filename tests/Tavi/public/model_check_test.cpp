@@ -4,7 +4,6 @@
 #include <cstring>
 #include <filesystem>
 #include <fstream>
-#include <functional>
 #include <iterator>
 #include <string>
 #include <vector>
@@ -24,68 +23,45 @@ std::string ReadFile(const std::string& path) {
   return std::string((std::istreambuf_iterator<char>(file)), std::istreambuf_iterator<char>());
 }
 
-void WriteFile(const std::string& path, const std::string& bytes) {
-  std::ofstream(path, std::ios::binary | std::ios::trunc) << bytes;
-}
-
+// Each broken copy of the shipped folder is named by the file (and line or
+// row) at fault and what is wrong there.
 TEST(ModelCheckTest, NamesTheFirstFaultOfABrokenCascadeFolder) {
   std::string message = "stale";
   EXPECT_EQ(checkDetectorModel(DetectorParams(kModelRoot.c_str(), "cascade.list"), message), STATUS_OK);
   EXPECT_EQ(message, "");
 
-  struct Fault {
-    std::function<void(const std::string&)> make;  // applied to the copy's root
-    std::string message;                           // behind the root
-  };
-  const std::vector<Fault> faults = {
-      {[](const std::string& r) { fs::remove(r + "cascade.list"); },
-       "cascade.list: missing or not a file"},
-      {[](const std::string& r) { WriteFile(r + "cascade.list", "cascades/x16Net-demo 0.4"); },
-       "cascade.list: the last line has no newline and would be ignored"},
-      {[](const std::string& r) { WriteFile(r + "cascade.list", "# nothing\n"); },
-       "cascade.list: names no stage"},
-      {[](const std::string& r) { WriteFile(r + "cascade.list", "cascades/x16Net-demo\n"); },
-       "cascade.list:1: needs a stage folder and a threshold"},
-      {[](const std::string& r) {
-         WriteFile(r + "cascade.list", "cascades/x16Net-demo 0.4\ncascades/x32Net 0.8\n\n");
-       },
+  const std::string kRemove = "<remove>";
+  const std::string kFolder = "<folder>";
+  const std::string x64Mean = ReadFile(kModelRoot + "cascades/x64Net/mean");
+  const struct { std::string file, contents, message; } faults[] = {
+      {"cascade.list", kRemove, "cascade.list: missing"},
+      {"cascade.list", "cascades/x16Net-demo 0.4", "cascade.list: the last line has no newline"},
+      {"cascade.list", "# nothing\n", "cascade.list: names no stage"},
+      {"cascade.list", "cascades/x16Net-demo 0.4\ncascades/x32Net 0.8\n\n",
        "cascade.list:3: needs a stage folder and a threshold"},
-      {[](const std::string& r) {
-         fs::remove(r + "cascades/x32Net/prototxt-deploy");
-         fs::create_directory(r + "cascades/x32Net/prototxt-deploy");
-       },
-       "cascades/x32Net/prototxt-deploy: missing or not a file"},
-      {[](const std::string& r) { WriteFile(r + "cascades/x32Net/prototxt-deploy", "layers {"); },
-       "cascades/x32Net/prototxt-deploy: not a network description"},
-      {[](const std::string& r) {
-         fs::copy_file(r + "cascades/x64Net/proto", r + "cascades/x32Net/proto",
-                       fs::copy_options::overwrite_existing);
-       },
-       "cascades/x32Net/proto: blob 0 of layer \"fcf\" is not of the shape its description gives"},
-      {[](const std::string& r) {
-         const std::string mean = ReadFile(r + "cascades/x64Net/mean");
-         WriteFile(r + "cascades/x64Net/mean", mean.substr(0, mean.find_last_not_of(" \n\t") + 1));
-       },
-       "cascades/x64Net/mean: must end in white space, or its last number is lost"},
-      {[](const std::string& r) { WriteFile(r + "cascades/x32Net/mean", "1 2 3\n"); },
+      {"cascades/x32Net/prototxt-deploy", kFolder, "cascades/x32Net/prototxt-deploy: missing"},
+      {"cascades/x32Net/prototxt-deploy", "layers {", "cascades/x32Net/prototxt-deploy: not a network"},
+      {"cascades/x32Net/proto", ReadFile(kModelRoot + "cascades/x64Net/proto"),
+       "cascades/x32Net/proto: blob 0 of layer \"fcf\" is not of the shape"},
+      {"cascades/x64Net/mean", x64Mean.substr(0, x64Mean.find_last_not_of(" \n\t") + 1),
+       "cascades/x64Net/mean: must end in white space"},
+      {"cascades/x32Net/mean", "1 2 3\n",
        "cascades/x32Net/mean: holds 3 numbers where the net's input has 1728"},
-      {[](const std::string& r) { fs::remove(r + "cascades/x32Net-x32-3Scales-200/proto"); },
-       "cascades/x32Net-x32-3Scales-200//proto: missing or not a file"},
-      {[](const std::string& r) {
-         WriteFile(r + "cascades/x32Net-x32-3Scales-200/offsets-scales", "0 0 1\n2000000000 0 1\n");
-       },
-       "cascades/x32Net-x32-3Scales-200//offsets-scales: row 2 needs a scale from 0.01 to 100 and "
-       "offsets within the net's input"},
+      {"cascades/x32Net-x32-3Scales-200/proto", kRemove, "cascades/x32Net-x32-3Scales-200//proto: missing"},
+      {"cascades/x32Net-x32-3Scales-200/offsets-scales", "0 0 1\n2000000000 0 1\n",
+       "cascades/x32Net-x32-3Scales-200//offsets-scales: row 2 needs a scale from 0.01 to 100"},
   };
-  for (const Fault& fault : faults) {
+  for (const auto& fault : faults) {
     TempDir dir;
     const std::string root = dir.path() + "/";
     fs::copy(kModelRoot + "cascades", root + "cascades", fs::copy_options::recursive);
     fs::copy_file(kModelRoot + "cascade.list", root + "cascade.list");
-    fault.make(root);
+    fs::remove(root + fault.file);
+    if (fault.contents == kFolder) fs::create_directory(root + fault.file);
+    if (fault.contents != kRemove && fault.contents != kFolder) dir.write(fault.file, fault.contents);
     EXPECT_EQ(checkDetectorModel(DetectorParams(root.c_str(), "cascade.list"), message),
               STATUS_MODEL_LOAD_FAILED);
-    EXPECT_EQ(message, root + fault.message);
+    EXPECT_EQ(message.substr(0, root.size() + fault.message.size()), root + fault.message);
   }
 }
 
@@ -97,30 +73,26 @@ TEST(ModelCheckTest, NamesTheFaultOfABrokenLandmarkModel) {
 
   // The file ends in the stage levels, the discarded word, the model flag,
   // the scales per octave and the face width.
-  auto withWordFromEnd = [&shipped](size_t wordsFromEnd, int32_t value) {
+  auto withWord = [&shipped](size_t offset, int32_t value) {
     std::string bytes = shipped;
-    std::memcpy(&bytes[bytes.size() - 4 * wordsFromEnd], &value, 4);
+    std::memcpy(&bytes[offset], &value, 4);
     return bytes;
   };
-  auto withWordFromStart = [&shipped](size_t word, int32_t value) {
-    std::string bytes = shipped;
-    std::memcpy(&bytes[4 * word], &value, 4);
-    return bytes;
-  };
+  const size_t end = shipped.size();
   const std::vector<std::pair<std::string, std::string>> faults = {
       {shipped.substr(0, 64), "cut short before its stages"},
-      {shipped.substr(0, shipped.size() - 2), "cut short"},
+      {shipped.substr(0, end - 2), "cut short"},
       {shipped + "tail", "4 bytes after the model"},
-      {withWordFromEnd(2, -3), "scales per octave must be 1 to 16"},
-      {withWordFromEnd(1, 0), "the face width must be 8 to 1024 pixels"},
-      {withWordFromEnd(5, 9), "a stage level outside 0 to 5"},
+      {withWord(end - 8, -3), "scales per octave must be 1 to 16"},
+      {withWord(end - 4, 0), "the face width must be 8 to 1024 pixels"},
+      {withWord(end - 20, 9), "a stage level outside 0 to 5"},
       {std::string(), "cut short before its stages"},
       // Found by fuzzing: a negative count of stage matrices.
-      {withWordFromStart(0, -1), "cut short before its stages"},
+      {withWord(0, -1), "cut short before its stages"},
   };
   TempDir dir;
   for (const auto& [bytes, fault] : faults) {
-    WriteFile(dir.path() + "/model.sdm", bytes);
+    dir.write("model.sdm", bytes);
     EXPECT_EQ(checkSDMModel(dir.path(), "model.sdm", message), STATUS_MODEL_LOAD_FAILED);
     EXPECT_EQ(message, dir.path() + "/model.sdm: " + fault);
     // All but trailing bytes also keep the model from loading.

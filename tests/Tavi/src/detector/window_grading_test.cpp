@@ -1,6 +1,5 @@
 #include "detector/window_grading.h"
 
-#include <google/protobuf/text_format.h>
 #include <gtest/gtest.h>
 
 #include <cmath>
@@ -9,6 +8,8 @@
 
 #include "detector/cascade_files.h"
 #include "detector/cascade_loader.h"
+#include "detector/image_planes.h"
+#include "nn/net.h"
 #include "test_cascade.h"
 
 namespace tavilib {
@@ -16,27 +17,21 @@ namespace {
 
 using namespace testing_cascade;
 
-CascadeStage ConstantStage(const std::vector<float>& logits) {
+// A stage of fixed logits, with the shipped calibration table.
+CascadeStage ConstantStage(const std::vector<float>& logits, nn::NetParameter weights = {}) {
   CascadeStage stage;
   stage.net.reset(new nn::Net<float>(ConstantWindowText(static_cast<int>(logits.size())),
                                      nn::NetDescription::kText));
-  stage.net->CopyTrainedLayersFrom(ConstantWindowWeights(logits));
-  return stage;
-}
-
-CascadeStage CalibrationStage(int favouredClass, size_t tableRows = 19) {
-  CascadeStage stage = ConstantStage(FavourClass(19, favouredClass));
-  TempDir dir;
-  stage.offsetsScales = readOffsetsScales(dir.write("offsets", DefaultOffsetsScales()));
-  stage.offsetsScales.resize(tableRows);
+  if (weights.layers_size() == 0) weights.ParseFromString(ConstantWindowWeights(logits));
+  stage.net->CopyTrainedLayersFrom(weights);
+  stage.offsetsScales = readOffsetsScales(kShippedOffsets);
   return stage;
 }
 
 Window At(int x, int y, int side) { return Window{x, y, side, side, 0.7f, 3}; }
 
-TEST(WindowGradingTest, GradingReplacesScoresAndKeepsTheList) {
+TEST(WindowGradingTest, GradingReplacesScoresWithTheFaceClassOfPlanesLessTheMean) {
   CascadeStage stage = ConstantStage({0.0f, 2.0f});
-  stage.mean.assign(1728, 128.0f);
   const cv::Mat image(100, 120, CV_8UC3, cv::Scalar::all(50));
   const std::vector<Window> graded = gradeWindows({At(0, 0, 30), At(70, 40, 50)}, stage, image);
   ASSERT_EQ(graded.size(), 2u);
@@ -47,86 +42,69 @@ TEST(WindowGradingTest, GradingReplacesScoresAndKeepsTheList) {
   // Nine windows, eight of them in one pass: each is normalised over all
   // three classes.
   CascadeStage three = ConstantStage({0.0f, 2.0f, 1.0f});
-  three.mean.assign(1728, 128.0f);
   for (const Window& window : gradeWindows(std::vector<Window>(9, At(0, 0, 30)), three, image)) {
     EXPECT_FLOAT_EQ(window.score, std::exp(2.0f) / (1.0f + std::exp(2.0f) + std::exp(1.0f)));
   }
 
   EXPECT_THROW(gradeWindows({At(90, 0, 40)}, stage, image), cv::Exception)
       << "a window that leaves the image";
-}
 
-TEST(WindowGradingTest, TheNetSeesPlanesInByteOrderTwoOneZeroLessTheMean) {
-  // The face logit is 0.05 times the average of plane 0 less its mean.
-  CascadeStage stage;
-  stage.net.reset(new nn::Net<float>(ConstantWindowText(2), nn::NetDescription::kText));
-  nn::NetParameter weights = ConstantWindowWeights({0.0f, 0.0f});
+  // The net sees planes of the third, second and first byte, less the mean.
+  const cv::Mat pixels = (cv::Mat_<cv::Vec3b>(1, 2) << cv::Vec3b(1, 2, 3), cv::Vec3b(4, 5, 6));
+  std::vector<float> planes(6);
+  writeImagePlanes(pixels, planes.data(), 6);
+  EXPECT_EQ(planes, (std::vector<float>{3, 6, 2, 5, 1, 4}));
+
+  // The face logit is 0.05 times the average of plane 0 less its mean of 200.
+  nn::NetParameter weights;
+  weights.ParseFromString(ConstantWindowWeights({0.0f, 0.0f}));
   for (int i = 0; i < 576; ++i) {
     weights.mutable_layers(0)->mutable_blobs(0)->set_data(1728 + i, 0.05f / 576.0f);
   }
-  stage.net->CopyTrainedLayersFrom(weights);
-  // A mean of 200 in plane 0 only: the third byte of a pixel.
-  stage.mean.assign(1728, 0.0f);
-  std::fill(stage.mean.begin(), stage.mean.begin() + 576, 200.0f);
-
-  cv::Mat image(48, 48, CV_8UC3, cv::Scalar(0, 0, 200));
-  EXPECT_NEAR(gradeWindows({At(0, 0, 48)}, stage, image)[0].score, 0.5f, 1e-6);
-  image.setTo(cv::Scalar(200, 0, 0));
-  EXPECT_LT(gradeWindows({At(0, 0, 48)}, stage, image)[0].score, 0.01f);
+  CascadeStage planeZero = ConstantStage({0.0f, 0.0f}, weights);
+  planeZero.mean.assign(1728, 0.0f);
+  std::fill(planeZero.mean.begin(), planeZero.mean.begin() + 576, 200.0f);
+  cv::Mat square(48, 48, CV_8UC3, cv::Scalar(0, 0, 200));
+  EXPECT_NEAR(gradeWindows({At(0, 0, 48)}, planeZero, square)[0].score, 0.5f, 1e-6);
+  square.setTo(cv::Scalar(200, 0, 0));
+  EXPECT_LT(gradeWindows({At(0, 0, 48)}, planeZero, square)[0].score, 0.01f);
 }
 
-TEST(WindowGradingTest, CalibrationShiftsAndScalesByTheBestClass) {
-  const cv::Mat image(200, 200, CV_8UC3, cv::Scalar::all(0));
-  // Class 4: offset (4, 0), scale 1, so x moves left by trunc(4 / 24 * 48) = 8.
-  CascadeStage left = CalibrationStage(4);
-  std::vector<Window> moved = calibrateWindows({At(100, 50, 48), At(7, 50, 48)}, left, image);
-  EXPECT_EQ(moved[0].x, 92);
-  EXPECT_EQ(moved[0].y, 50);
-  EXPECT_EQ(moved[0].score, 0.7f);
-  EXPECT_EQ(moved[1].x, 7) << "x would become -1: the window stays whole";
-
-  // Class 2: offset (-4, 0) moves right; touching the right edge is refused.
-  CascadeStage right = CalibrationStage(2);
-  moved = calibrateWindows({At(143, 0, 48), At(144, 0, 48)}, right, image);
-  EXPECT_EQ(moved[0].x, 151);
-  EXPECT_EQ(moved[1].x, 144) << "152 is columns minus width: not strictly inside";
-
-  // Class 9: offset (1, 1), scale 11/12 enlarges: 48 / 0.9166667 = 52.36.
-  CascadeStage larger = CalibrationStage(9);
-  moved = calibrateWindows({At(100, 100, 48)}, larger, image);
-  EXPECT_EQ(moved[0].x, 98);
-  EXPECT_EQ(moved[0].y, 98);
-  EXPECT_EQ(moved[0].width, 52);
-  EXPECT_EQ(moved[0].height, 52);
-
-  CascadeStage still = CalibrationStage(0);
-  EXPECT_EQ(calibrateWindows({At(10, 10, 48)}, still, image)[0].x, 10);
+// Calibrates `in` on a 200 x 200 image with a net of fixed logits, against
+// the shipped table cut to `rows` rows and with row `row` replaced if given.
+cv::Rect Calibrate(const std::vector<float>& logits, const cv::Rect& in, size_t rows = 19,
+                   int row = -1, const OffsetScale& correction = {}) {
+  static const cv::Mat image(200, 200, CV_8UC3, cv::Scalar::all(0));
+  CascadeStage stage = ConstantStage(logits);
+  stage.offsetsScales.resize(rows);
+  if (row >= 0) stage.offsetsScales[row] = correction;
+  const Window moved = calibrateWindows({Window{in.x, in.y, in.width, in.height, 0.7f, 3}}, stage, image)[0];
+  EXPECT_EQ(moved.score, 0.7f);
+  return cv::Rect(moved.x, moved.y, moved.width, moved.height);
 }
 
-TEST(WindowGradingTest, CalibrationNeedsAClaimOfOneInTenWithinTheTable) {
-  const cv::Mat image(200, 200, CV_8UC3, cv::Scalar::all(0));
-  // Nineteen equal logits: every class at 1/19.
-  CascadeStage undecided = ConstantStage(std::vector<float>(19, 0.0f));
-  TempDir dir;
-  undecided.offsetsScales = readOffsetsScales(dir.write("offsets", DefaultOffsetsScales()));
-  EXPECT_EQ(calibrateWindows({At(100, 100, 48)}, undecided, image)[0].x, 100);
-
-  // The favoured class 4 lies beyond a table of four rows.
-  CascadeStage shortTable = CalibrationStage(4, 4);
-  EXPECT_EQ(calibrateWindows({At(100, 100, 48)}, shortTable, image)[0].x, 100);
-
+TEST(WindowGradingTest, CalibrationMovesStrictlyInsideByAClaimOfOneInTenWithinTheTable) {
+  // Class 4 is offset (4, 0): x moves left by trunc(4 / 24 * 48) = 8. Class 2
+  // (-4, 0) moves right, but not onto the right edge. Class 9, (1, 1) at
+  // scale 11/12, enlarges 48 to 52.
+  const struct { int favoured; cv::Rect in, out; } cases[] = {
+      {4, {100, 50, 48, 48}, {92, 50, 48, 48}},  {4, {7, 50, 48, 48}, {7, 50, 48, 48}},
+      {2, {143, 0, 48, 48}, {151, 0, 48, 48}},   {2, {144, 0, 48, 48}, {144, 0, 48, 48}},
+      {9, {100, 100, 48, 48}, {98, 98, 52, 52}}, {0, {10, 10, 48, 48}, {10, 10, 48, 48}}};
+  for (const auto& c : cases) {
+    EXPECT_EQ(Calibrate(Favour(c.favoured), c.in), c.out) << c.favoured << " " << c.in;
+  }
+  // Ten equal classes claim one in ten each, and the first moves; nineteen
+  // claim too little. Class 4 lies beyond a table of four rows.
+  const cv::Rect at(100, 100, 48, 48);
+  EXPECT_EQ(Calibrate(std::vector<float>(10, 0.0f), at, 19, 0, {4, 0, 1.0f}), cv::Rect(92, 100, 48, 48));
+  EXPECT_EQ(Calibrate(std::vector<float>(19, 0.0f), at, 19, 0, {4, 0, 1.0f}), at);
+  EXPECT_EQ(Calibrate(Favour(4), at, 4), at);
   // Corrections no integer holds (a scale of 0 or a tiny one, offsets near
   // 2^31) cannot land inside the image: the window stays, whole.
   for (const OffsetScale& wild : {OffsetScale{0, 0, 0.0f}, OffsetScale{0, 0, 1e-30f},
-                                  OffsetScale{2000000000, 0, 1.0f},
-                                  OffsetScale{0, -2147483647, 1.0f}}) {
-    CascadeStage table = CalibrationStage(4);
-    table.offsetsScales[4] = wild;
-    const Window moved = calibrateWindows({At(100, 100, 48)}, table, image)[0];
-    EXPECT_EQ(moved.x, 100);
-    EXPECT_EQ(moved.y, 100);
-    EXPECT_EQ(moved.width, 48);
-    EXPECT_EQ(moved.height, 48);
+                                  OffsetScale{2000000000, 0, 1.0f}, OffsetScale{0, -2147483647, 1.0f}}) {
+    EXPECT_EQ(Calibrate(Favour(4), at, 19, 4, wild), at);
   }
 }
 
@@ -146,7 +124,7 @@ TEST(WindowGradingTest, WindowsTakenTogetherComeOutAsAlone) {
     }
   }
   CascadeStage calibration = loadDeployStage(root + "x32Net-x32-3Scales-200");
-  calibration.offsetsScales = readOffsetsScales(root + "x32Net-x32-3Scales-200/offsets-scales");
+  calibration.offsetsScales = readOffsetsScales(kShippedOffsets);
   const std::vector<Window> together = calibrateWindows(windows, calibration, photo);
   for (size_t i = 0; i < windows.size(); ++i) {
     const Window alone = calibrateWindows({windows[i]}, calibration, photo)[0];
