@@ -1,7 +1,5 @@
 #include <gtest/gtest.h>
 
-#include <functional>
-#include <map>
 #include <memory>
 #include <typeinfo>
 
@@ -22,42 +20,45 @@ LayerParameter Param(int type) {
   return param;
 }
 
-TEST(LayerFactoryTest, EveryTypeOfTheSchemaGetsItsClass) {
-  using P = LayerParameter;
-  const std::map<int, const std::type_info*> classes = {
-      {P::ACCURACY, &typeid(AccuracyLayer<float>)}, {P::BNLL, &typeid(BNLLLayer<float>)},
-      {P::CONCAT, &typeid(ConcatLayer<float>)}, {P::CONVOLUTION, &typeid(ConvolutionLayer<float>)},
-      {P::DATA, &typeid(DataLayer<float>)}, {P::DROPOUT, &typeid(DropoutLayer<float>)},
-      {P::EUCLIDEAN_LOSS, &typeid(EuclideanLossLayer<float>)},
-      {P::FLATTEN, &typeid(FlattenLayer<float>)}, {P::IM2COL, &typeid(Im2colLayer<float>)},
-      {P::IMAGE_DATA, &typeid(ImageDataLayer<float>)},
-      {P::INFOGAIN_LOSS, &typeid(InfogainLossLayer<float>)},
-      {P::INNER_PRODUCT, &typeid(InnerProductLayer<float>)}, {P::LRN, &typeid(LRNLayer<float>)},
-      {P::MULTINOMIAL_LOGISTIC_LOSS, &typeid(MultinomialLogisticLossLayer<float>)},
-      {P::POOLING, &typeid(PoolingLayer<float>)}, {P::RELU, &typeid(ReLULayer<float>)},
-      {P::SIGMOID, &typeid(SigmoidLayer<float>)}, {P::SOFTMAX, &typeid(SoftmaxLayer<float>)},
-      {P::SOFTMAX_LOSS, &typeid(SoftmaxWithLossLayer<float>)},
-      {P::SPLIT, &typeid(SplitLayer<float>)}, {P::TANH, &typeid(TanHLayer<float>)},
-      {P::ELTWISE_PRODUCT, &typeid(EltwiseProductLayer<float>)},
-      {P::POWER, &typeid(PowerLayer<float>)}, {P::HINGE_LOSS, &typeid(HingeLossLayer<float>)},
-      {P::SIGMOID_CROSS_ENTROPY_LOSS, &typeid(SigmoidCrossEntropyLossLayer<float>)},
-      {P::MEMORY_DATA, &typeid(MemoryDataLayer<float>)},
+// The numbers are those stored in weight files; each gets its class.
+TEST(LayerFactoryTest, EveryTypeNumberOfTheSchemaGetsItsClass) {
+  const struct {
+    const char* name;
+    int number;
+    const std::type_info* type;  // null: no layer
+  } types[] = {
+      {"ACCURACY", 1, &typeid(AccuracyLayer<float>)}, {"BNLL", 2, &typeid(BNLLLayer<float>)},
+      {"CONCAT", 3, &typeid(ConcatLayer<float>)}, {"CONVOLUTION", 4, &typeid(ConvolutionLayer<float>)},
+      {"DATA", 5, &typeid(DataLayer<float>)}, {"DROPOUT", 6, &typeid(DropoutLayer<float>)},
+      {"EUCLIDEAN_LOSS", 7, &typeid(EuclideanLossLayer<float>)},
+      {"FLATTEN", 8, &typeid(FlattenLayer<float>)}, {"HDF5_DATA", 9, nullptr},
+      {"HDF5_OUTPUT", 10, nullptr}, {"IM2COL", 11, &typeid(Im2colLayer<float>)},
+      {"IMAGE_DATA", 12, &typeid(ImageDataLayer<float>)},
+      {"INFOGAIN_LOSS", 13, &typeid(InfogainLossLayer<float>)},
+      {"INNER_PRODUCT", 14, &typeid(InnerProductLayer<float>)}, {"LRN", 15, &typeid(LRNLayer<float>)},
+      {"MULTINOMIAL_LOGISTIC_LOSS", 16, &typeid(MultinomialLogisticLossLayer<float>)},
+      {"POOLING", 17, &typeid(PoolingLayer<float>)}, {"RELU", 18, &typeid(ReLULayer<float>)},
+      {"SIGMOID", 19, &typeid(SigmoidLayer<float>)}, {"SOFTMAX", 20, &typeid(SoftmaxLayer<float>)},
+      {"SOFTMAX_LOSS", 21, &typeid(SoftmaxWithLossLayer<float>)},
+      {"SPLIT", 22, &typeid(SplitLayer<float>)}, {"TANH", 23, &typeid(TanHLayer<float>)},
+      {"ELTWISE_PRODUCT", 25, &typeid(EltwiseProductLayer<float>)},
+      {"POWER", 26, &typeid(PowerLayer<float>)},
+      {"SIGMOID_CROSS_ENTROPY_LOSS", 27, &typeid(SigmoidCrossEntropyLossLayer<float>)},
+      {"HINGE_LOSS", 28, &typeid(HingeLossLayer<float>)},
+      {"MEMORY_DATA", 29, &typeid(MemoryDataLayer<float>)},
   };
-  const google::protobuf::EnumDescriptor* types = LayerParameter::LayerType_descriptor();
-  for (int i = 0; i < types->value_count(); ++i) {
-    const int type = types->value(i)->number();
-    if (type == P::NONE || type == P::WINDOW_DATA) {
-      continue;  // fatal, below
+  const google::protobuf::EnumDescriptor* schema = LayerParameter::LayerType_descriptor();
+  EXPECT_EQ(schema->value_count(), 30) << "with NONE = 0 and WINDOW_DATA = 24, fatal below";
+  EXPECT_EQ(schema->FindValueByName("NONE")->number(), 0);
+  EXPECT_EQ(schema->FindValueByName("WINDOW_DATA")->number(), 24);
+  for (const auto& t : types) {
+    ASSERT_EQ(schema->FindValueByName(t.name)->number(), t.number) << t.name;
+    std::unique_ptr<Layer<float>> layer(GetLayer<float>(Param(t.number)));
+    ASSERT_EQ(layer != nullptr, t.type != nullptr) << t.name;
+    if (layer) {
+      EXPECT_EQ(typeid(*layer), *t.type) << t.name;
+      EXPECT_EQ(layer->layer_param().name(), "x") << "constructed with the whole parameter";
     }
-    std::unique_ptr<Layer<float>> layer(GetLayer<float>(Param(type)));
-    if (type == P::HDF5_DATA || type == P::HDF5_OUTPUT) {
-      EXPECT_FALSE(layer) << types->value(i)->name();
-      continue;
-    }
-    ASSERT_TRUE(classes.count(type)) << "no expectation for " << types->value(i)->name();
-    ASSERT_TRUE(layer) << types->value(i)->name();
-    EXPECT_EQ(typeid(*layer), *classes.at(type)) << types->value(i)->name();
-    EXPECT_EQ(layer->layer_param().name(), "x") << "constructed with the whole parameter";
   }
 }
 

@@ -9,6 +9,7 @@
 
 #include "blob_proto_maker.h"
 #include "gradient_checker.h"
+#include "nn/util/insert_splits.h"
 #include "temp_dir.h"
 
 namespace nn {
@@ -93,6 +94,44 @@ TEST(NetDeathTest, PassesRefuseTheWrongState) {
         net.FF();
       },
       "firstConvLayerIndex_ == 0 .*First Layer Should be Conv Layer.");
+}
+
+TEST(InsertSplitsTest, SharedBlobsGetASplitAndEachConsumerItsOwnTop) {
+  NetParameter split;
+  InsertSplits(Parse<NetParameter>(R"(input: "data"
+    layers { name: "a" type: CONVOLUTION bottom: "data" top: "a" }
+    layers { name: "relu" type: RELU bottom: "a" top: "a" }
+    layers { name: "b" type: POOLING bottom: "data" top: "b" }
+    layers { name: "c" type: CONCAT bottom: "a" bottom: "b" bottom: "a" top: "c" })"),
+               &split);
+  std::vector<std::string> wiring;
+  for (const LayerParameter& layer : split.layers()) {
+    std::string line = layer.name() + ":";
+    for (const std::string& name : layer.bottom()) {
+      line += " " + name;
+    }
+    line += " ->";
+    for (const std::string& name : layer.top()) {
+      line += " " + name;
+    }
+    wiring.push_back(line);
+  }
+  // The first consumer works in place; a split follows the last producer.
+  EXPECT_EQ(wiring, (std::vector<std::string>{
+                        "input_data_0_split: data -> data input_data_0_split_1", "a: data -> a",
+                        "relu: a -> a", "relu_a_0_split: a -> a relu_a_0_split_1",
+                        "b: input_data_0_split_1 -> b", "c: a b relu_a_0_split_1 -> c"}));
+  EXPECT_EQ(split.layers(0).type(), LayerParameter::SPLIT);
+
+  const NetParameter plain = Parse<NetParameter>(
+      "name: 'plain' input: 'data' layers { name: 'a' bottom: 'data' top: 'a' } "
+      "layers { name: 'b' bottom: 'a' top: 'b' }");
+  InsertSplits(plain, &split);
+  EXPECT_EQ(split.DebugString(), plain.DebugString()) << "single consumers are left alone";
+  EXPECT_DEATH(InsertSplits(Parse<NetParameter>("input: 'data' layers { name: 'a' bottom: "
+                                                "'data' bottom: 'nothing' }"),
+                            &split),
+               "Unknown blob input nothing to layer 1");
 }
 
 TEST(NetTest, OutputsAreTheUnconsumedBlobsInNameOrder) {
