@@ -45,10 +45,8 @@ inline void SetValues(Blob<float>* blob, const std::vector<float>& values) {
 inline void FillUniform(Blob<float>* blob, float low, float high, unsigned seed = 1) {
   std::mt19937 generator(seed);
   std::uniform_real_distribution<float> draw(low, high);
-  float* data = blob->mutable_cpu_data();
-  for (int i = 0; i < blob->count(); ++i) {
-    data[i] = draw(generator);
-  }
+  std::generate(blob->mutable_cpu_data(), blob->mutable_cpu_data() + blob->count(),
+                [&] { return draw(generator); });
 }
 
 // The layer of a LayerParameter text, set up on one bottom and one top.
@@ -77,14 +75,13 @@ inline void CheckDerivatives(const Blobs& blobs, const std::function<double()>& 
   }
   for (size_t b = 0; b < blobs.size(); ++b) {
     for (int k = 0; k < blobs[b]->count(); ++k) {
-      float* data = blobs[b]->mutable_cpu_data();
-      const float original = data[k];
-      data[k] = original + step;
+      float& x = blobs[b]->mutable_cpu_data()[k];
+      const float original = x;
+      x = original + step;
       const double plus = objective();
-      data[k] = original - step;
-      const double minus = objective();
-      data[k] = original;
-      const double numeric = (plus - minus) / (2.0 * step);
+      x = original - step;
+      const double numeric = (plus - objective()) / (2.0 * step);
+      x = original;
       const double scale = std::max({1.0, std::fabs(numeric), std::fabs(double(analytic[b][k]))});
       ASSERT_NEAR(analytic[b][k], numeric, tolerance * scale) << "blob " << b << " element " << k;
     }
@@ -97,10 +94,10 @@ inline void CheckDerivatives(const Blobs& blobs, const std::function<double()>& 
 // the second holds targets or labels.
 inline void CheckGradient(Layer<float>* layer, const Blobs& bottom, Blobs* top, float step,
                           float tolerance = 1e-2f) {
-  layer->Forward(bottom, top);
-  std::vector<std::vector<float>> weights;
   std::mt19937 generator(7);
   std::uniform_real_distribution<float> draw(-1.0f, 1.0f);
+  layer->Forward(bottom, top);
+  std::vector<std::vector<float>> weights;  // kept apart: a layer may share diffs
   for (Blob<float>* out : *top) {
     weights.emplace_back(out->count());
     std::generate(weights.back().begin(), weights.back().end(), [&] { return draw(generator); });

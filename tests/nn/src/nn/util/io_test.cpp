@@ -3,8 +3,12 @@
 #include <gtest/gtest.h>
 #include <unistd.h>
 
+#include <sstream>
 #include <string>
+#include <vector>
 
+#include "gradient_checker.h"
+#include "nn/util/upgrade_proto.h"
 #include "temp_dir.h"
 
 namespace nn {
@@ -82,6 +86,137 @@ TEST(IoDeathTest, UnreadableFilesEndTheProcessWithTheirWords) {
   // Weight files above one gibibyte are refused.
   EXPECT_DEATH(ReadNetParamsFromBinaryFile(WriteHugeNameMessage(dir, (1u << 30) + 1), &param),
                "Failed to parse NetParameter file: ");
+}
+
+using testing::internal::CaptureStderr;
+using testing::internal::GetCapturedStderr;
+
+// The messages of the log lines in captured stderr, without their prefixes.
+std::vector<std::string> LoggedMessages(const std::string& captured) {
+  std::vector<std::string> messages;
+  std::istringstream lines(captured);
+  for (std::string line; std::getline(lines, line);) {
+    messages.push_back(line.substr(line.find("] ") + 2));
+  }
+  return messages;
+}
+
+// An old net whose padding layers stand behind a net input, behind another
+// layer (overriding the convolution's own pad) and in front of nothing. One
+// convolution has a stray parameter; the first layer is of the current
+// generation already, and keeps only its wiring.
+const char kV0Net[] = R"(
+name: "cascade12" input: "data" input_dim: 1 input_dim: 3 input_dim: 12 force_backward: true
+layers { name: "r" type: RELU bottom: "data" top: "r" }
+layers { layer { type: "padding" pad: 2 } bottom: "data" top: "p1" }
+layers { layer { name: "c1" type: "conv" num_output: 16 biasterm: false kernelsize: 3 group: 2
+                 stride: 3 weight_filler { type: "xavier" } bias_filler { value: 0.5 }
+                 blobs { num: 1 } blobs { num: 2 } blobs_lr: 1 weight_decay: 0 source: "stray" }
+         bottom: "p1" top: "c1" }
+layers { layer { name: "pool" type: "pool" pool: STOCHASTIC kernelsize: 3 stride: 2 }
+         bottom: "c1" top: "pool" }
+layers { layer { type: "padding" pad: 1 } bottom: "pool" top: "p2" }
+layers { layer { name: "c2" type: "conv" pad: 9 } bottom: "p2" top: "c2" }
+layers { layer { type: "padding" pad: 5 } bottom: "c2" top: "unread" })";
+
+const char kCurrentNet[] = R"(
+name: "cascade12" input: "data" input_dim: 1 input_dim: 3 input_dim: 12 force_backward: true
+layers { bottom: "data" top: "r" }
+layers { name: "c1" type: CONVOLUTION bottom: "data" top: "c1"
+         blobs { num: 1 } blobs { num: 2 } blobs_lr: 1 weight_decay: 0
+         convolution_param { num_output: 16 bias_term: false pad: 2 kernel_size: 3 group: 2
+                             stride: 3 weight_filler { type: "xavier" }
+                             bias_filler { value: 0.5 } } }
+layers { name: "pool" type: POOLING bottom: "c1" top: "pool"
+         pooling_param { pool: STOCHASTIC kernel_size: 3 stride: 2 } }
+layers { name: "c2" type: CONVOLUTION bottom: "pool" top: "c2" convolution_param { pad: 1 } })";
+
+TEST(UpgradeProtoTest, OldDescriptionsReadAsTheirCurrentForms) {
+  TempDir dir;
+  for (const bool binary : {false, true}) {
+    const std::string file =
+        binary ? dir.write("old.binaryproto", Parse<NetParameter>(kV0Net).SerializeAsString())
+               : dir.write("old.prototxt", kV0Net);
+    const std::vector<std::string> lines = {
+        "Attempting to upgrade input file specified using deprecated V0LayerParameter: " + file,
+        "Unknown parameter source for layer type conv",
+        "Warning: had one or more problems upgrading V0NetParameter to NetParameter (see above); "
+        "continuing anyway.",
+        std::string("Note that future releases will not support V0NetParameter; use ") +
+            (binary ? "./build/tools/upgrade_net_proto_binary.bin"
+                    : "./build/tools/upgrade_net_proto_text.bin") +
+            " to upgrade this and any other network proto files to the new format."};
+    NetParameter param;
+    CaptureStderr();
+    (binary ? ReadNetParamsFromBinaryFile : ReadNetParamsFromTextFile)(file, &param);
+    EXPECT_EQ(LoggedMessages(GetCapturedStderr()), lines);
+    EXPECT_EQ(param.DebugString(), Parse<NetParameter>(kCurrentNet).DebugString());
+  }
+}
+
+TEST(UpgradeProtoTest, OldParametersGoToTheirPlaceOrAreLoggedAndDropped) {
+  const struct {
+    const char* v0;
+    const char* current;
+    std::vector<std::string> lines;  // none: the upgrade reports success
+  } cases[] = {
+      {"type: 'images' source: 'l' scale: 2 meanfile: 'm' batchsize: 5 cropsize: 6 mirror: true"
+       " rand_skip: 9 shuffle_images: true new_height: 30 new_width: 40 new_num: 3 new_channels: 4",
+       "type: IMAGE_DATA image_data_param { source: 'l' scale: 2 mean_file: 'm' batch_size: 5"
+       " crop_size: 6 mirror: true rand_skip: 9 shuffle: true new_height: 30 new_width: 40 }", {}},
+      {"type: 'window_data' source: 'w' meanfile: 'm' batchsize: 8 cropsize: 9 mirror: true"
+       " det_fg_threshold: 0.6 det_bg_threshold: 0.4 det_fg_fraction: 0.3 det_context_pad: 16"
+       " det_crop_mode: 'square'",
+       "type: WINDOW_DATA window_data_param { source: 'w' mean_file: 'm' batch_size: 8 crop_size: 9"
+       " mirror: true fg_threshold: 0.6 bg_threshold: 0.4 fg_fraction: 0.3 context_pad: 16"
+       " crop_mode: 'square' }", {}},
+      {"type: 'hdf5_output' hdf5_output_param { file_name: 'f' }",
+       "type: HDF5_OUTPUT hdf5_output_param { file_name: 'f' }", {}},
+      // Places the new message has but the upgrade doesn't give.
+      {"type: 'pool' pad: 1", "type: POOLING", {"Unknown parameter pad for layer type pool"}},
+      {"type: 'data' shuffle_images: true", "type: DATA",
+       {"Unknown parameter shuffle for layer type data"}},
+      // In the order of the old fields, not of the text.
+      {"type: 'relu' concat_dim: 2 num_output: 1", "type: RELU",
+       {"Unknown parameter num_output for layer type relu",
+        "Unknown parameter concat_dim for layer type relu"}},
+      // Without a type every parameter is unknown, and the type stays unset.
+      {"name: 'x' kernelsize: 3", "name: 'x'", {"Unknown parameter kernelsize for layer type "}},
+  };
+  for (const auto& c : cases) {
+    const std::string wiring = "bottom: 'in' top: 'out' ";
+    const LayerParameter v0 = Parse<LayerParameter>(wiring + "layer { " + c.v0 + " }");
+    LayerParameter layer;
+    CaptureStderr();
+    EXPECT_EQ(UpgradeLayerParameter(v0, &layer), c.lines.empty()) << c.v0;
+    EXPECT_EQ(LoggedMessages(GetCapturedStderr()), c.lines) << c.v0;
+    EXPECT_EQ(layer.DebugString(), Parse<LayerParameter>(wiring + c.current).DebugString());
+  }
+}
+
+TEST(UpgradeProtoDeathTest, WiringItCannotFollowAndUnknownTypesEndTheProcess) {
+  const std::string padding = "layers { layer { type: 'padding' } bottom: 'a' top: 'p' }\n";
+  const struct {
+    std::string layers;  // reading the net input a
+    const char* message;
+  } cases[] = {
+      // The number is the bottom's position in its layer.
+      {"layers { layer { type: 'concat' } bottom: 'a' bottom: 'x' }",
+       "Unknown blob input x to layer 1"},
+      {padding + "layers { layer { type: 'pool' } bottom: 'p' }",
+       "Check failed: layer_param.type\\(\\) == \"conv\" "
+       "Padding layer input to non-convolutional layer type pool"},
+      {padding + "layers { layer { type: 'padding' } bottom: 'p' top: 'q' }\n"
+                 "layers { layer { type: 'conv' } bottom: 'q' }",
+       "Padding layer input to non-convolutional layer type padding"},
+      // Type names compare exactly.
+      {"layers { layer { type: 'Conv' } }", "Unknown layer name: Conv"},
+  };
+  for (const auto& c : cases) {
+    const NetParameter v0 = Parse<NetParameter>("input: 'a'\n" + c.layers);
+    NetParameter upgraded;
+    EXPECT_DEATH(UpgradeV0Net(v0, &upgraded), c.message);
+  }
 }
 
 }  // namespace
