@@ -53,7 +53,7 @@ TEST(NetTest, FFAddsTheFirstRunResponseFlatEvenAfterAShrink) {
   EXPECT_EQ(Values(out), (std::vector<float>{36.0f + 0.5f + 900.5f, 72.0f - 1.0f + 900.5f}));
 }
 
-TEST(NetTest, FirstRunStopsAtTheFirstConvolution) {
+TEST(NetDeathTest, FirstRunStopsAtTheFirstConvolutionWhichFFWantsFirst) {
   Net<float> net(R"(
     input: "data" input_dim: 1 input_dim: 1 input_dim: 6 input_dim: 6
     layers { name: "pool" type: POOLING bottom: "data" top: "pool"
@@ -67,6 +67,7 @@ TEST(NetTest, FirstRunStopsAtTheFirstConvolution) {
   net.FirstRun();
   EXPECT_EQ(net.blobs()[2]->cpu_data()[0], 100.0f) << "conv ran";
   EXPECT_EQ(net.output_blob()->cpu_data()[0], 0.0f) << "softmax did not";
+  EXPECT_DEATH(net.FF(), "firstConvLayerIndex_ == 0 .*First Layer Should be Conv Layer.");
 }
 
 TEST(NetDeathTest, PassesRefuseTheWrongState) {
@@ -81,19 +82,6 @@ TEST(NetDeathTest, PassesRefuseTheWrongState) {
   EXPECT_EXIT(run(2, true), testing::ExitedWithCode(255), "Invoke FirstRun\\(\\) twice");
   EXPECT_EXIT(run(1, false), testing::ExitedWithCode(255),
               "Should not Invoke FirstRun\\(\\) before FF ");
-  // Two consumers of the input put a split layer in front of the convolution.
-  EXPECT_DEATH(
-      {
-        Net<float> net(R"(input: "data" input_dim: 1 input_dim: 1 input_dim: 4 input_dim: 4
-          layers { name: "conv" type: CONVOLUTION bottom: "data" top: "conv"
-                   convolution_param { num_output: 1 kernel_size: 3 } }
-          layers { name: "pool" type: POOLING bottom: "data" top: "pool"
-                   pooling_param { kernel_size: 2 } })",
-                       NetDescription::kText);
-        net.FirstRun();
-        net.FF();
-      },
-      "firstConvLayerIndex_ == 0 .*First Layer Should be Conv Layer.");
 }
 
 TEST(InsertSplitsTest, SharedBlobsGetASplitAndEachConsumerItsOwnTop) {

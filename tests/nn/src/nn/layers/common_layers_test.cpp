@@ -74,29 +74,6 @@ TEST(PlumbingLayersTest, ConcatJoinsSplitAndFlattenShareEltwiseMultiplies) {
             (std::vector<int>{2, 18, 2, 3}));
 }
 
-TEST(PlumbingLayersDeathTest, SetUpChecks) {
-  Blob<float> a(1, 2, 3, 3);
-  Blob<float> b(1, 1, 2, 3);
-  Blob<float> out;
-  Blobs one = {&a};
-  Blobs unequal = {&a, &b};
-  Blobs top = {&out};
-  EXPECT_DEATH(ConcatLayer<float>(LayerParameter()).SetUp(one, &top),
-               "Concat Layer takes at least two blobs as input.");
-  EXPECT_DEATH(ConcatLayer<float>(Parse<LayerParameter>("concat_param { concat_dim: 2 }"))
-                   .SetUp(unequal, &top),
-               "For now concat_dim <=1, it can only concat num and channels");
-  EXPECT_DEATH(ConcatLayer<float>(LayerParameter()).SetUp(unequal, &top),
-               "Check failed: count_ == \\(\\*top\\)\\[0\\]->count\\(\\) ");
-  Blobs in_place_second = {&out, &a};
-  EXPECT_DEATH(SplitLayer<float>(LayerParameter()).SetUp(one, &in_place_second),
-               "Only 0th top blob may be in place.");
-  EXPECT_DEATH(EltwiseProductLayer<float>(LayerParameter()).SetUp(unequal, &top),
-               "Check failed: channels == bottom\\[i\\]->channels\\(\\) ");
-  EXPECT_DEATH(InnerProductLayer<float>(LayerParameter()).SetUp(unequal, &top),
-               "IP Layer takes a single blob as input.");
-}
-
 TEST(SoftmaxLayerTest, NormalisesEachPositionOfTheFirstImageOnly) {
   // Logits are logarithms of these, channel by channel: the first image has
   // 1, 2, 5 at its first position and 3, 3, 2 at its second, each summing to 8;
@@ -118,25 +95,6 @@ TEST(SoftmaxLayerTest, NormalisesEachPositionOfTheFirstImageOnly) {
   const std::vector<float> probs = OneLayer("type: SOFTMAX", &far).Forward();
   EXPECT_NEAR(probs[2], 1 / (1 + std::exp(-1.0)), 1e-6);
   EXPECT_TRUE(std::isnan(probs[1]));
-}
-
-TEST(SoftmaxLayerTest, AlterInputShapeToANonSquareMap) {
-  Blob<float> in(1, 2, 3, 4);
-  OneLayer softmax("type: SOFTMAX", &in);
-  in.RewriteShape(1, 2, 2, 3);
-  FillUniform(&in, -1, 1);
-  softmax.layer->AlterInputShape(3, 2, softmax.bottom, &softmax.top);
-  const std::vector<float> out = softmax.Forward();
-  ASSERT_EQ(out.size(), 12u);
-  for (int p = 0; p < 6; ++p) {
-    EXPECT_NEAR(out[p] + out[6 + p], 1.0f, 1e-6) << p;
-  }
-}
-
-TEST(SoftmaxLayerDeathTest, OneChannelIsRefused) {
-  Blob<float> in(1, 1, 2, 2);
-  EXPECT_DEATH(OneLayer("type: SOFTMAX", &in),
-               "channels\\(\\) >= 2 .*Softmax Layer takes more than two-channels output.");
 }
 
 TEST(NeuronLayersTest, ForwardFormulasAndTheirOverflows) {
@@ -202,16 +160,6 @@ TEST(NeuronLayersTest, DropoutScalesSurvivorsInTrainingAndCopiesInTesting) {
   Engine::set_phase(Engine::TEST);
   EXPECT_DEATH(dropout.layer->Backward(dropout.top, true, &dropout.bottom),
                "Check failed: Engine::phase\\(\\) == Engine::TRAIN ");
-}
-
-TEST(NeuronLayersDeathTest, OneBottomAndOneTop) {
-  Blob<float> a(1, 1, 1, 1);
-  Blobs two = {&a, &a};
-  Blobs one = {&a};
-  EXPECT_DEATH(ReLULayer<float>(LayerParameter()).SetUp(two, &one),
-               "Neuron Layer takes a single blob as input.");
-  EXPECT_DEATH(ReLULayer<float>(LayerParameter()).SetUp(one, &two),
-               "Neuron Layer takes a single blob as output.");
 }
 
 }  // namespace

@@ -41,40 +41,10 @@ TEST(ConvolutionLayerTest, GroupsSeeTheirOwnChannelsThroughPaddingAndStride) {
                   &ones);
   EXPECT_EQ(padded.layer->blobs().size(), 1u) << "no bias blob";
   EXPECT_EQ(padded.Forward(), (std::vector<float>{4, 6, 4, 6, 9, 6, 4, 6, 4}));
-}
-
-TEST(ConvolutionLayerTest, AlterInputShapeRewritesTheTopWithoutMemory) {
-  Blob<float> in(1, 2, 10, 10);
-  OneLayer conv(Conv("num_output: 3 kernel_size: 3"), &in);
-  const size_t bytes = conv.out.data()->size();
-  in.RewriteShape(1, 2, 5, 4);
-  conv.layer->AlterInputShape(4, 5, conv.bottom, &conv.top);
-  EXPECT_EQ(Shape(conv.out), (std::vector<int>{1, 3, 3, 2}));
-  EXPECT_EQ(conv.out.data()->size(), bytes);
 
   // A bottom smaller than the kernel: (2 - 3) / 2 + 1 truncates to 1.
   Blob<float> small(1, 1, 2, 2);
   EXPECT_EQ(OneLayer(Conv("num_output: 1 kernel_size: 3 stride: 2"), &small).out.height(), 1);
-}
-
-TEST(ConvolutionLayerDeathTest, SetUpChecksItsParameters) {
-  Blob<float> in(1, 3, 5, 5);
-  Blob<float> four(1, 4, 5, 5);
-  Blob<float> out;
-  Blobs two = {&in, &in};
-  Blobs top = {&out};
-  EXPECT_DEATH(ConvolutionLayer<float>(Parse<LayerParameter>(Conv("num_output: 1 kernel_size: 3")))
-                   .SetUp(two, &top),
-               "bottom.size\\(\\) == 1 .*Conv Layer takes a single blob as input.");
-  EXPECT_DEATH(OneLayer(Conv("kernel_size: 3"), &in), "Check failed: num_output_ > 0 ");
-  EXPECT_DEATH(OneLayer(Conv("num_output: 2 kernel_size: 3 group: 2"), &in),
-               "Check failed: channels_ % group_ == 0 ");
-  EXPECT_DEATH(OneLayer(Conv("num_output: 3 kernel_size: 3 group: 2"), &four),
-               "Number of output should be multiples of group.");
-  EXPECT_DEATH(static_cast<ConvolutionLayer<float>*>(
-                   OneLayer(Conv("num_output: 2 kernel_size: 3 group: 2"), &four).layer.get())
-                   ->CheckBinarization(),
-               "binarization supports only single group.");
 }
 
 // Pools a plane whose values count up from 0, row by row.
@@ -110,25 +80,6 @@ TEST(PoolingLayerTest, SizesRoundUpAndAveragesCountPadding) {
   const std::vector<float> outside = PoolRamp(1, 5, "pool: AVE kernel_size: 1 stride: 3");
   EXPECT_EQ(outside[2], 0.0f);
   EXPECT_TRUE(std::signbit(outside[2])) << "0 divided by a negative window size";
-}
-
-TEST(PoolingLayerTest, AlterInputShapeFollowsTheBottom) {
-  Blob<float> in(1, 1, 10, 10);
-  OneLayer pool("type: POOLING pooling_param { kernel_size: 3 stride: 2 }", &in);
-  const size_t bytes = pool.out.data()->size();
-  in.RewriteShape(1, 1, 6, 5);
-  pool.layer->AlterInputShape(5, 6, pool.bottom, &pool.top);
-  EXPECT_EQ(Shape(pool.out), (std::vector<int>{1, 1, 3, 2}));  // ceil(3 / 2) + 1, ceil(2 / 2) + 1
-  EXPECT_EQ(pool.out.data()->size(), bytes);
-}
-
-TEST(PoolingLayerDeathTest, PaddingOnlyForAverageAndUnknownMethods) {
-  Blob<float> in(1, 1, 4, 4);
-  EXPECT_DEATH(OneLayer("type: POOLING pooling_param { kernel_size: 2 pad: 1 }", &in),
-               "Padding implemented only for average pooling.");
-  EXPECT_DEATH(OneLayer("type: POOLING pooling_param { pool: STOCHASTIC kernel_size: 2 }", &in)
-                   .Forward(),
-               "Not Implemented Yet");
 }
 
 // x (1 + s) ^ -0.75 for the sums of squares s of each cell's window; alpha
