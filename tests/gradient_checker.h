@@ -8,6 +8,7 @@
 #include <cmath>
 #include <functional>
 #include <memory>
+#include <numeric>
 #include <random>
 #include <string>
 #include <vector>
@@ -64,6 +65,27 @@ struct OneLayer {
   Blobs top = {&out};
   std::unique_ptr<Layer<float>> layer;
 };
+
+// One forward pass of the layer of a LayerParameter text over a bottom of the
+// given shape and values; the top's shape goes to top_shape if asked for.
+inline std::vector<float> ForwardOn(const std::string& text, const std::vector<int>& shape,
+                                    const std::vector<float>& values,
+                                    std::vector<int>* top_shape = nullptr) {
+  Blob<float> in(shape[0], shape[1], shape[2], shape[3]);
+  SetValues(&in, values);
+  OneLayer layer(text, &in);
+  if (top_shape) {
+    *top_shape = Shape(layer.out);
+  }
+  return layer.Forward();
+}
+
+// 0, 1, 2, ... n - 1.
+inline std::vector<float> Ramp(int n) {
+  std::vector<float> values(n);
+  std::iota(values.begin(), values.end(), 0.0f);
+  return values;
+}
 
 // Compares the derivatives left in the diffs of `blobs` with central
 // differences of `objective` over their data.

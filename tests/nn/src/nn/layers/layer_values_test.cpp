@@ -1,8 +1,8 @@
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
 #include <limits>
-#include <numeric>
 #include <string>
 #include <vector>
 
@@ -35,52 +35,38 @@ TEST(ConvolutionLayerTest, GroupsSeeTheirOwnChannelsThroughPaddingAndStride) {
   EXPECT_EQ(conv.Forward(), (std::vector<float>{0.5f, 3.5f, 9.5f, 24.5f, -1, 59, 179, 479}));
 
   // Padding cells are zeros: a constant image varies at the rim.
-  Blob<float> ones(1, 1, 3, 3);
-  std::fill(ones.mutable_cpu_data(), ones.mutable_cpu_data() + 9, 1.0f);
-  OneLayer padded(Conv("num_output: 1 kernel_size: 3 pad: 1 bias_term: false "
-                       "weight_filler { type: 'constant' value: 1 }"),
-                  &ones);
-  EXPECT_EQ(padded.layer->blobs().size(), 1u) << "no bias blob";
-  EXPECT_EQ(padded.Forward(), (std::vector<float>{4, 6, 4, 6, 9, 6, 4, 6, 4}));
-
+  EXPECT_EQ(ForwardOn(Conv("num_output: 1 kernel_size: 3 pad: 1 bias_term: false "
+                           "weight_filler { type: 'constant' value: 1 }"),
+                      {1, 1, 3, 3}, std::vector<float>(9, 1)),
+            (std::vector<float>{4, 6, 4, 6, 9, 6, 4, 6, 4}));
   // A bottom smaller than the kernel: (2 - 3) / 2 + 1 truncates to 1.
-  Blob<float> small(1, 1, 2, 2);
-  EXPECT_EQ(OneLayer(Conv("num_output: 1 kernel_size: 3 stride: 2"), &small).out.height(), 1);
-}
-
-// Pools a plane whose values count up from 0, row by row.
-std::vector<float> PoolRamp(int height, int width, const std::string& pooling,
-                            std::vector<int>* shape = nullptr) {
-  Blob<float> in(1, 1, height, width);
-  std::iota(in.mutable_cpu_data(), in.mutable_cpu_data() + in.count(), 0.0f);
-  OneLayer pool("type: POOLING pooling_param { " + pooling + " }", &in);
-  if (shape) {
-    *shape = Shape(pool.out);
-  }
-  return pool.Forward();
+  std::vector<int> shape;
+  ForwardOn(Conv("num_output: 1 kernel_size: 3 stride: 2"), {1, 1, 2, 2}, Ramp(4), &shape);
+  EXPECT_EQ(shape, (std::vector<int>{1, 1, 1, 1}));
 }
 
 TEST(PoolingLayerTest, SizesRoundUpAndAveragesCountPadding) {
   // Height 10, kernel 3, stride 2: ceil(7 / 2) + 1 = 5 rows (a convolution
   // gets 4); the last window holds rows 8 and 9 only. Values are 4 row + column.
   std::vector<int> shape;
-  EXPECT_EQ(PoolRamp(10, 4, "kernel_size: 3 stride: 2", &shape),
+  EXPECT_EQ(ForwardOn("type: POOLING pooling_param { kernel_size: 3 stride: 2 }", {1, 1, 10, 4},
+                      Ramp(40), &shape),
             (std::vector<float>{10, 11, 18, 19, 26, 27, 34, 35, 38, 39}));
   EXPECT_EQ(shape, (std::vector<int>{1, 1, 5, 2}));
-
   // Padding cells count in the divisor: the corner is (0 + 1 + 3 + 4) / 9.
-  const std::vector<float> average = PoolRamp(3, 3, "pool: AVE kernel_size: 3 pad: 1");
-  ASSERT_EQ(average.size(), 9u);
+  const std::vector<float> average = ForwardOn(
+      "type: POOLING pooling_param { pool: AVE kernel_size: 3 pad: 1 }", {1, 1, 3, 3}, Ramp(9));
   EXPECT_FLOAT_EQ(average[0], 8.0f / 9.0f);
   EXPECT_FLOAT_EQ(average[4], 36.0f / 9.0f);
-
   // Width 5, kernel 1, stride 3: windows at 0, 3 and 6, the last outside the
   // image, where each method keeps its start value.
-  const std::vector<float> max = PoolRamp(1, 5, "kernel_size: 1 stride: 3");
-  EXPECT_EQ(max, (std::vector<float>{0, 3, std::numeric_limits<float>::lowest()}));
-  const std::vector<float> outside = PoolRamp(1, 5, "pool: AVE kernel_size: 1 stride: 3");
-  EXPECT_EQ(outside[2], 0.0f);
-  EXPECT_TRUE(std::signbit(outside[2])) << "0 divided by a negative window size";
+  EXPECT_EQ(ForwardOn("type: POOLING pooling_param { kernel_size: 1 stride: 3 }", {1, 1, 1, 5},
+                      Ramp(5)),
+            (std::vector<float>{0, 3, std::numeric_limits<float>::lowest()}));
+  const float outside = ForwardOn("type: POOLING pooling_param { pool: AVE kernel_size: 1 "
+                                  "stride: 3 }", {1, 1, 1, 5}, Ramp(5))[2];
+  EXPECT_EQ(outside, 0.0f);
+  EXPECT_TRUE(std::signbit(outside)) << "0 divided by a negative window size";
 }
 
 // x (1 + s) ^ -0.75 for the sums of squares s of each cell's window; alpha
@@ -102,29 +88,20 @@ TEST(LRNLayerTest, WindowsAcrossChannelsAfterAShrinkAndWithinAChannel) {
   const std::vector<float> x = {1, 4, 2, 3, 3, 2, 4, 1};
   SetValues(&in, x);
   across.layer->AlterInputShape(2, 1, across.bottom, &across.top);
-  EXPECT_EQ(Shape(across.out), (std::vector<int>{1, 4, 1, 2}));
   // Channels c - 1 to c + 1, none beyond the ends.
   ExpectNormalised(across.Forward(), x, {5, 25, 14, 29, 29, 14, 25, 5});
   // An even size is one short on the leading side: c - 1 to c + 2.
-  ExpectNormalised(OneLayer("type: LRN lrn_param { local_size: 4 alpha: 4 }", &in).Forward(), x,
-                   {14, 29, 30, 30, 29, 14, 25, 5});
-
+  ExpectNormalised(ForwardOn("type: LRN lrn_param { local_size: 4 alpha: 4 }", {1, 4, 1, 2}, x),
+                   x, {14, 29, 30, 30, 29, 14, 25, 5});
   // Within a channel: a zero-padded 3 x 3 window, divided by its full size.
-  Blob<float> row(1, 1, 1, 4);
-  SetValues(&row, {1, 2, 3, 4});
-  ExpectNormalised(
-      OneLayer("type: LRN lrn_param { local_size: 3 alpha: 9 norm_region: WITHIN_CHANNEL }", &row)
-          .Forward(),
-      {1, 2, 3, 4}, {5, 14, 29, 25});
-}
-
-void Ramp(Blob<float>* blob, float start) {
-  std::iota(blob->mutable_cpu_data(), blob->mutable_cpu_data() + blob->count(), start);
+  ExpectNormalised(ForwardOn("type: LRN lrn_param { local_size: 3 alpha: 9 norm_region: "
+                             "WITHIN_CHANNEL }", {1, 1, 1, 4}, {1, 2, 3, 4}),
+                   {1, 2, 3, 4}, {5, 14, 29, 25});
 }
 
 TEST(InnerProductLayerTest, ImagesAreFlatRowsTimesTheWeightsPlusTheBias) {
   Blob<float> in(2, 1, 2, 2);
-  Ramp(&in, 0);
+  SetValues(&in, Ramp(8));
   OneLayer ip("type: INNER_PRODUCT inner_product_param { num_output: 2 }", &in);
   ASSERT_EQ(Shape(*ip.layer->blobs()[0]), (std::vector<int>{1, 1, 2, 4}));
   SetValues(ip.layer->blobs()[0].get(), {1, 0, 0, 0, 0, 1, 1, 1});
@@ -132,28 +109,32 @@ TEST(InnerProductLayerTest, ImagesAreFlatRowsTimesTheWeightsPlusTheBias) {
   EXPECT_EQ(ip.Forward(), (std::vector<float>{0, 16, 4, 28}));
 }
 
-TEST(PlumbingLayersTest, ConcatJoinsSplitAndFlattenShareEltwiseMultiplies) {
+TEST(PlumbingLayersTest, ConcatJoinsWhileSplitAndFlattenShare) {
   Blob<float> a(1, 2, 1, 2);
   Blob<float> b(1, 1, 1, 2);
   Blob<float> c(2, 2, 1, 2);
-  Ramp(&a, 0);
-  Ramp(&b, 10);
-  Ramp(&c, 20);
+  SetValues(&a, Ramp(4));
+  SetValues(&b, {10, 11});
+  SetValues(&c, {20, 21, 22, 23, 24, 25, 26, 27});
   Blob<float> out;
-  Blobs top = {&out};
-  Blobs by_channels = {&a, &b};
-  ConcatLayer<float> channels{LayerParameter()};
-  channels.SetUp(by_channels, &top);
-  channels.Forward(by_channels, &top);
-  EXPECT_EQ(Shape(out), (std::vector<int>{1, 3, 1, 2}));
-  EXPECT_EQ(Values(out), (std::vector<float>{0, 1, 2, 3, 10, 11}));
-  Blobs by_num = {&a, &c};
-  ConcatLayer<float> nums(Parse<LayerParameter>("concat_param { concat_dim: 0 }"));
-  nums.SetUp(by_num, &top);
-  nums.Forward(by_num, &top);
-  EXPECT_EQ(Values(out), (std::vector<float>{0, 1, 2, 3, 20, 21, 22, 23, 24, 25, 26, 27}));
-
   Blob<float> second;
+  Blobs top = {&out};
+  const struct {
+    const char* param;
+    Blobs bottom;
+    std::vector<int> shape;
+    std::vector<float> joined;
+  } concats[] = {{"", {&a, &b}, {1, 3, 1, 2}, {0, 1, 2, 3, 10, 11}},
+                 {"concat_param { concat_dim: 0 }", {&a, &c}, {3, 2, 1, 2},
+                  {0, 1, 2, 3, 20, 21, 22, 23, 24, 25, 26, 27}}};
+  for (const auto& concat : concats) {
+    ConcatLayer<float> layer(Parse<LayerParameter>(concat.param));
+    layer.SetUp(concat.bottom, &top);
+    layer.Forward(concat.bottom, &top);
+    EXPECT_EQ(Shape(out), concat.shape);
+    EXPECT_EQ(Values(out), concat.joined);
+  }
+
   Blobs bottom = {&c};
   Blobs tops = {&out, &second};
   SplitLayer<float> split{LayerParameter()};
@@ -164,17 +145,6 @@ TEST(PlumbingLayersTest, ConcatJoinsSplitAndFlattenShareEltwiseMultiplies) {
   flatten.Forward();
   EXPECT_EQ(Shape(flatten.out), (std::vector<int>{2, 4, 1, 1}));
   EXPECT_EQ(flatten.out.cpu_data(), c.cpu_data());
-
-  Blobs factors = {&c, &c, &c};
-  EltwiseProductLayer<float> multiply{LayerParameter()};
-  multiply.SetUp(factors, &top);
-  multiply.Forward(factors, &top);
-  EXPECT_EQ(out.cpu_data()[7], 27.0f * 27 * 27);
-
-  Blob<float> image(2, 2, 4, 5);
-  EXPECT_EQ(Shape(OneLayer("type: IM2COL convolution_param { kernel_size: 3 pad: 1 stride: 2 }",
-                           &image).out),
-            (std::vector<int>{2, 18, 2, 3}));
 }
 
 TEST(SoftmaxLayerTest, NormalisesEachPositionOfTheFirstImageOnly) {
@@ -182,41 +152,34 @@ TEST(SoftmaxLayerTest, NormalisesEachPositionOfTheFirstImageOnly) {
   // 1, 2, 5 at its first position and 3, 3, 2 at its second, each summing to 8;
   // the second image's maximum is 8 too, but its positions sum to 7 and 11.
   const std::vector<float> e = {1, 3, 2, 3, 5, 2, 1, 8, 4, 2, 2, 1};
-  Blob<float> in(2, 3, 1, 2);
-  for (int i = 0; i < 12; ++i) {
-    in.mutable_cpu_data()[i] = std::log(e[i]);
-  }
-  const std::vector<float> out = OneLayer("type: SOFTMAX", &in).Forward();
+  std::vector<float> logits(12);
+  std::transform(e.begin(), e.end(), logits.begin(), [](float v) { return std::log(v); });
+  const std::vector<float> out = ForwardOn("type: SOFTMAX", {2, 3, 1, 2}, logits);
   for (int i = 0; i < 12; ++i) {
     EXPECT_NEAR(out[i], e[i] / 8, 1e-6) << i;
   }
-
   // One maximum for the whole image: the second position lies 200 below it,
   // so its exponentials underflow and give 0 / 0.
-  Blob<float> far(1, 2, 1, 2);
-  SetValues(&far, {0, -200, 1, -199});
-  const std::vector<float> probs = OneLayer("type: SOFTMAX", &far).Forward();
+  const std::vector<float> probs = ForwardOn("type: SOFTMAX", {1, 2, 1, 2}, {0, -200, 1, -199});
   EXPECT_NEAR(probs[2], 1 / (1 + std::exp(-1.0)), 1e-6);
   EXPECT_TRUE(std::isnan(probs[1]));
 }
 
 TEST(NeuronLayersTest, ForwardFormulasAndTheirOverflows) {
-  Blob<float> x(1, 1, 1, 4);
-  SetValues(&x, {-2.0f, 0.5f, 60.0f, std::numeric_limits<float>::quiet_NaN()});
-  const std::vector<float> relu = OneLayer("type: RELU", &x).Forward();
-  EXPECT_EQ(relu[0], 0.0f);
-  EXPECT_EQ(relu[2], 60.0f);
+  const std::vector<int> four = {1, 1, 1, 4};
+  const std::vector<float> x = {-2.0f, 0.5f, 60.0f, std::numeric_limits<float>::quiet_NaN()};
+  const std::vector<float> relu = ForwardOn("type: RELU", four, x);
+  EXPECT_EQ(std::vector<float>(relu.begin(), relu.begin() + 3), (std::vector<float>{0, 0.5f, 60}));
   EXPECT_TRUE(std::isnan(relu[3])) << "a NaN stays NaN";
-  EXPECT_FLOAT_EQ(OneLayer("type: SIGMOID", &x).Forward()[1], 1.0f / (1.0f + std::exp(-0.5f)));
-  const std::vector<float> tanh = OneLayer("type: TANH", &x).Forward();
+  EXPECT_FLOAT_EQ(ForwardOn("type: SIGMOID", four, x)[1], 1.0f / (1.0f + std::exp(-0.5f)));
+  const std::vector<float> tanh = ForwardOn("type: TANH", four, x);
   EXPECT_FLOAT_EQ(tanh[0], std::tanh(-2.0f));
   EXPECT_TRUE(std::isnan(tanh[2])) << "exp(120) overflows: inf / inf";
-  const std::vector<float> softplus = OneLayer("type: BNLL", &x).Forward();
+  const std::vector<float> softplus = ForwardOn("type: BNLL", four, x);
   EXPECT_FLOAT_EQ(softplus[0], std::log1p(std::exp(-2.0f)));
   EXPECT_FLOAT_EQ(softplus[2], 60.0f);
 
   // Power: (shift + scale x) ^ power, with 1 for power 0 whatever the shift.
-  SetValues(&x, {1, 2, 4, 0});
   const struct {
     const char* param;
     std::vector<float> expected;
@@ -225,36 +188,34 @@ TEST(NeuronLayersTest, ForwardFormulasAndTheirOverflows) {
                 {"power: 0.5 scale: 2 shift: 1", {std::sqrt(3.0f), std::sqrt(5.0f), 3, 1}},
                 {"", {1, 2, 4, 0}}};
   for (const auto& p : powers) {
-    EXPECT_EQ(OneLayer(std::string("type: POWER power_param { ") + p.param + " }", &x).Forward(),
+    EXPECT_EQ(ForwardOn(std::string("type: POWER power_param { ") + p.param + " }", four,
+                        {1, 2, 4, 0}),
               p.expected)
         << p.param;
   }
 
   // In place, ReLU overwrites its bottom.
-  Blobs same = {&x};
-  SetValues(&x, {-1, 2, -3, 4});
+  Blob<float> y(1, 1, 1, 4);
+  SetValues(&y, {-1, 2, -3, 4});
+  Blobs same = {&y};
   ReLULayer<float> relu_in_place{LayerParameter()};
   relu_in_place.SetUp(same, &same);
   relu_in_place.Forward(same, &same);
-  EXPECT_EQ(Values(x), (std::vector<float>{0, 2, 0, 4}));
+  EXPECT_EQ(Values(y), (std::vector<float>{0, 2, 0, 4}));
 }
 
 TEST(NeuronLayersTest, DropoutScalesSurvivorsInTrainingAndCopiesInTesting) {
   Blob<float> x(1, 1, 20, 20);
-  std::fill(x.mutable_cpu_data(), x.mutable_cpu_data() + 400, 1.0f);
+  SetValues(&x, std::vector<float>(400, 1.0f));
   Engine::set_phase(Engine::TEST);
   OneLayer dropout("type: DROPOUT dropout_param { dropout_ratio: 0.75 }", &x);
   EXPECT_EQ(dropout.Forward(), std::vector<float>(400, 1.0f));
 
   Engine::set_phase(Engine::TRAIN);
   const std::vector<float> kept = dropout.Forward();
-  int survivors = 0;
-  for (float v : kept) {
-    ASSERT_TRUE(v == 0.0f || v == 4.0f) << v;
-    survivors += v != 0.0f;
-  }
-  EXPECT_GT(survivors, 50);
-  EXPECT_LT(survivors, 150);
+  EXPECT_EQ(std::count(kept.begin(), kept.end(), 0.0f) + std::count(kept.begin(), kept.end(), 4.0f),
+            400);
+  EXPECT_NEAR(std::count(kept.begin(), kept.end(), 4.0f), 100, 50);
   std::fill(dropout.out.mutable_cpu_diff(), dropout.out.mutable_cpu_diff() + 400, 0.5f);
   dropout.layer->Backward(dropout.top, true, &dropout.bottom);
   for (int i = 0; i < 400; ++i) {
