@@ -2,10 +2,13 @@
 
 #include <gtest/gtest.h>
 
+#include <algorithm>
 #include <cmath>
 #include <cstdlib>
 #include <memory>
+#include <numeric>
 #include <string>
+#include <utility>
 
 #include "gradient_checker.h"
 #include "nn/filler.h"
@@ -31,49 +34,37 @@ void Fill(const std::string& text, Blob<float>* blob) {
   std::unique_ptr<Filler<float>>(GetFiller<float>(Parse<FillerParameter>(text)))->Fill(blob);
 }
 
-TEST(FillerTest, EachTypeFillsWithinItsLaw) {
-  Blob<float> blob(2, 3, 4, 5);
-  Fill("value: 2.5", &blob);
-  for (int i = 0; i < blob.count(); ++i) {
-    ASSERT_EQ(blob.cpu_data()[i], 2.5f);
-  }
-  Fill("type: 'uniform' min: -3 max: -2", &blob);
-  for (int i = 0; i < blob.count(); ++i) {
-    ASSERT_TRUE(blob.cpu_data()[i] >= -3.0f && blob.cpu_data()[i] <= -2.0f);
-  }
-  Fill("type: 'positive_unitball'", &blob);
-  for (int n = 0; n < 2; ++n) {
-    float sum = 0;
-    for (int j = 0; j < 60; ++j) {
-      ASSERT_GT(blob.cpu_data()[n * 60 + j], 0.0f);
-      sum += blob.cpu_data()[n * 60 + j];
-    }
-    EXPECT_NEAR(sum, 1.0f, 1e-5);
-  }
-  // Xavier bounds: sqrt(3 / fan_in), fan_in = 60 per num, and 1 for a column.
-  Fill("type: 'xavier'", &blob);
-  for (int i = 0; i < blob.count(); ++i) {
-    ASSERT_LE(std::fabs(blob.cpu_data()[i]), std::sqrt(3.0f / 60.0f));
-  }
-  Blob<float> column(6, 1, 1, 1);
-  Fill("type: 'xavier'", &column);
-  for (int i = 0; i < 6; ++i) {
-    ASSERT_LE(std::fabs(column.cpu_data()[i]), std::sqrt(3.0f));
-  }
-  // The default sparsity -1 means no mask and no shape demand.
-  Fill("type: 'gaussian' mean: 10 std: 0.1", &blob);
-  EXPECT_NEAR(blob.cpu_data()[0], 10.0f, 1.0f);
+// The lowest and the highest value of a blob filled as `text` says.
+std::pair<float, float> FilledRange(const std::string& text, Blob<float>* blob) {
+  Fill(text, blob);
+  const auto range = std::minmax_element(blob->cpu_data(), blob->cpu_data() + blob->count());
+  return {*range.first, *range.second};
+}
 
+TEST(FillerTest, EachTypeFillsWithinItsLaw) {
+  using Range = std::pair<float, float>;
+  Blob<float> blob(2, 3, 4, 5);
+  EXPECT_EQ(FilledRange("value: 2.5", &blob), Range(2.5f, 2.5f));
+  const Range uniform = FilledRange("type: 'uniform' min: -3 max: -2", &blob);
+  EXPECT_TRUE(uniform.first >= -3 && uniform.second <= -2);
+  // Xavier bounds: sqrt(3 / fan_in), fan_in = 60 per num, and 1 for a column.
+  const Range xavier = FilledRange("type: 'xavier'", &blob);
+  EXPECT_TRUE(xavier.first >= -std::sqrt(0.05f) && xavier.second <= std::sqrt(0.05f));
+  Blob<float> column(6, 1, 1, 1);
+  const Range wide = FilledRange("type: 'xavier'", &column);
+  EXPECT_TRUE(wide.first >= -std::sqrt(3.0f) && wide.second <= std::sqrt(3.0f));
+  // The default sparsity -1 means no mask and no shape demand.
+  EXPECT_NEAR(FilledRange("type: 'gaussian' mean: 10 std: 0.1", &blob).first, 10.0f, 1.0f);
+  EXPECT_GT(FilledRange("type: 'positive_unitball'", &blob).first, 0.0f);
+  for (int n = 0; n < 2; ++n) {
+    EXPECT_NEAR(std::accumulate(blob.cpu_data() + n * 60, blob.cpu_data() + n * 60 + 60, 0.0f),
+                1.0f, 1e-5);
+  }
   // Sparse Gaussian masks a matrix: sparse / height is the chance of a weight.
   Blob<float> matrix(1, 1, 50, 8);
-  Fill("type: 'gaussian' sparse: 0", &matrix);
-  for (int i = 0; i < matrix.count(); ++i) {
-    ASSERT_EQ(matrix.cpu_data()[i], 0.0f);
-  }
+  EXPECT_EQ(FilledRange("type: 'gaussian' sparse: 0", &matrix), Range(0, 0));
   Fill("type: 'gaussian' mean: 5 sparse: 50", &matrix);
-  for (int i = 0; i < matrix.count(); ++i) {
-    ASSERT_NE(matrix.cpu_data()[i], 0.0f);
-  }
+  EXPECT_EQ(std::count(matrix.cpu_data(), matrix.cpu_data() + matrix.count(), 0.0f), 0);
 }
 
 TEST(FillerDeathTest, BadParametersEndTheProcessWithTheirWords) {

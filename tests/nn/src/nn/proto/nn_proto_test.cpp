@@ -3,16 +3,11 @@
 
 #include <memory>
 #include <string>
-#include <typeinfo>
 #include <vector>
 
 #include "gradient_checker.h"
-#include "nn/common_layers.h"
 #include "nn/data_layers.h"
-#include "nn/loss_layers.h"
-#include "nn/neuron_layers.h"
 #include "nn/proto/nn.pb.h"
-#include "nn/vision_layers.h"
 
 namespace nn {
 namespace {
@@ -68,49 +63,30 @@ LayerParameter Param(int type) {
   return param;
 }
 
-// The numbers are those stored in weight files; each gets its class.
-TEST(LayerFactoryTest, EveryTypeNumberOfTheSchemaGetsItsClass) {
-  const struct {
-    const char* name;
-    int number;
-    const std::type_info* type;  // null: no layer
-  } types[] = {
-      {"ACCURACY", 1, &typeid(AccuracyLayer<float>)}, {"BNLL", 2, &typeid(BNLLLayer<float>)},
-      {"CONCAT", 3, &typeid(ConcatLayer<float>)}, {"CONVOLUTION", 4, &typeid(ConvolutionLayer<float>)},
-      {"DATA", 5, &typeid(DataLayer<float>)}, {"DROPOUT", 6, &typeid(DropoutLayer<float>)},
-      {"EUCLIDEAN_LOSS", 7, &typeid(EuclideanLossLayer<float>)},
-      {"FLATTEN", 8, &typeid(FlattenLayer<float>)}, {"HDF5_DATA", 9, nullptr},
-      {"HDF5_OUTPUT", 10, nullptr}, {"IM2COL", 11, &typeid(Im2colLayer<float>)},
-      {"IMAGE_DATA", 12, &typeid(ImageDataLayer<float>)},
-      {"INFOGAIN_LOSS", 13, &typeid(InfogainLossLayer<float>)},
-      {"INNER_PRODUCT", 14, &typeid(InnerProductLayer<float>)}, {"LRN", 15, &typeid(LRNLayer<float>)},
-      {"MULTINOMIAL_LOGISTIC_LOSS", 16, &typeid(MultinomialLogisticLossLayer<float>)},
-      {"POOLING", 17, &typeid(PoolingLayer<float>)}, {"RELU", 18, &typeid(ReLULayer<float>)},
-      {"SIGMOID", 19, &typeid(SigmoidLayer<float>)}, {"SOFTMAX", 20, &typeid(SoftmaxLayer<float>)},
-      {"SOFTMAX_LOSS", 21, &typeid(SoftmaxWithLossLayer<float>)},
-      {"SPLIT", 22, &typeid(SplitLayer<float>)}, {"TANH", 23, &typeid(TanHLayer<float>)},
-      {"ELTWISE_PRODUCT", 25, &typeid(EltwiseProductLayer<float>)},
-      {"POWER", 26, &typeid(PowerLayer<float>)},
-      {"SIGMOID_CROSS_ENTROPY_LOSS", 27, &typeid(SigmoidCrossEntropyLossLayer<float>)},
-      {"HINGE_LOSS", 28, &typeid(HingeLossLayer<float>)},
-      {"MEMORY_DATA", 29, &typeid(MemoryDataLayer<float>)},
-  };
-  const google::protobuf::EnumDescriptor* schema = LayerParameter::LayerType_descriptor();
-  EXPECT_EQ(schema->value_count(), 30) << "with NONE = 0 and WINDOW_DATA = 24, fatal below";
-  EXPECT_EQ(schema->FindValueByName("NONE")->number(), 0);
-  EXPECT_EQ(schema->FindValueByName("WINDOW_DATA")->number(), 24);
-  for (const auto& t : types) {
-    ASSERT_EQ(schema->FindValueByName(t.name)->number(), t.number) << t.name;
-    std::unique_ptr<Layer<float>> layer(GetLayer<float>(Param(t.number)));
-    ASSERT_EQ(layer != nullptr, t.type != nullptr) << t.name;
-    if (layer) {
-      EXPECT_EQ(typeid(*layer), *t.type) << t.name;
-      EXPECT_EQ(layer->layer_param().name(), "x") << "constructed with the whole parameter";
-    }
+// The numbers are those stored in weight files. Each type but NONE and
+// WINDOW_DATA gets a layer made with the whole parameter, but the HDF5 ones;
+// layer tests build their layers through the factory, which checks the classes.
+TEST(LayerFactoryDeathTest, TypeNumbersAreThoseOfTheWeightFilesAndGiveTheirLayers) {
+  const google::protobuf::EnumDescriptor* types = LayerParameter::LayerType_descriptor();
+  std::string names;
+  for (int number = 0; number < types->value_count(); ++number) {
+    names += types->FindValueByNumber(number)->name() + " ";
   }
-}
-
-TEST(LayerFactoryDeathTest, NoTypeWindowDataAndUnknownNumbersAreFatal) {
+  EXPECT_EQ(names,
+            "NONE ACCURACY BNLL CONCAT CONVOLUTION DATA DROPOUT EUCLIDEAN_LOSS FLATTEN HDF5_DATA "
+            "HDF5_OUTPUT IM2COL IMAGE_DATA INFOGAIN_LOSS INNER_PRODUCT LRN MULTINOMIAL_LOGISTIC_LOSS "
+            "POOLING RELU SIGMOID SOFTMAX SOFTMAX_LOSS SPLIT TANH WINDOW_DATA ELTWISE_PRODUCT POWER "
+            "SIGMOID_CROSS_ENTROPY_LOSS HINGE_LOSS MEMORY_DATA ");
+  const auto make = [](int number) {
+    return std::unique_ptr<Layer<float>>(number == 24 ? nullptr : GetLayer<float>(Param(number)));
+  };
+  for (int number = 1; number < 30; ++number) {
+    const bool none = number == 9 || number == 10 || number == 24;
+    EXPECT_EQ(make(number) ? make(number)->layer_param().name() : "", none ? "" : "x") << number;
+  }
+  EXPECT_TRUE(dynamic_cast<DataLayer<float>*>(make(5).get()));
+  EXPECT_TRUE(dynamic_cast<ImageDataLayer<float>*>(make(12).get()));
+  EXPECT_TRUE(dynamic_cast<MemoryDataLayer<float>*>(make(29).get()));
   EXPECT_DEATH(GetLayer<float>(Param(LayerParameter::NONE)), "Layer x has unspecified type.");
   EXPECT_DEATH(GetLayer<float>(Param(LayerParameter::WINDOW_DATA)), "Layer x has unknown type 24");
   EXPECT_DEATH(GetLayer<float>(Param(30)), "Layer x has unknown type 30");
