@@ -16,25 +16,20 @@ namespace {
 // pooling, ReLU in place, LRN, inner products, concatenation and softmax.
 const char kCascadeLikeNet[] = R"(
   input: "data" input_dim: 1 input_dim: 3 input_dim: 10 input_dim: 10
-  layers { name: "conv1" type: CONVOLUTION bottom: "data" top: "conv1"
+  layers { type: CONVOLUTION bottom: "data" top: "c1"
            convolution_param { num_output: 4 kernel_size: 3 } }
-  layers { name: "pool1" type: POOLING bottom: "conv1" top: "pool1"
-           pooling_param { pool: MAX kernel_size: 3 stride: 2 } }
-  layers { name: "relu1" type: RELU bottom: "pool1" top: "pool1" }
-  layers { name: "norm1" type: LRN bottom: "pool1" top: "norm1"
-           lrn_param { local_size: 3 alpha: 0.5 beta: 0.75 } }
-  layers { name: "fc1" type: INNER_PRODUCT bottom: "norm1" top: "fc1"
-           inner_product_param { num_output: 5 } }
-  layers { name: "small" type: POOLING bottom: "data" top: "small"
+  layers { type: POOLING bottom: "c1" top: "p1" pooling_param { kernel_size: 3 stride: 2 } }
+  layers { type: RELU bottom: "p1" top: "p1" }
+  layers { type: LRN bottom: "p1" top: "n1" lrn_param { local_size: 3 alpha: 0.5 } }
+  layers { type: INNER_PRODUCT bottom: "n1" top: "f1" inner_product_param { num_output: 5 } }
+  layers { type: POOLING bottom: "data" top: "s"
            pooling_param { pool: AVE kernel_size: 3 stride: 2 } }
-  layers { name: "conv2" type: CONVOLUTION bottom: "small" top: "conv2"
+  layers { type: CONVOLUTION bottom: "s" top: "c2"
            convolution_param { num_output: 3 kernel_size: 3 } }
-  layers { name: "fc2" type: INNER_PRODUCT bottom: "conv2" top: "fc2"
-           inner_product_param { num_output: 4 } }
-  layers { name: "both" type: CONCAT bottom: "fc1" bottom: "fc2" top: "both" }
-  layers { name: "fcf" type: INNER_PRODUCT bottom: "both" top: "fcf"
-           inner_product_param { num_output: 3 } }
-  layers { name: "probs" type: SOFTMAX bottom: "fcf" top: "probs" }
+  layers { type: INNER_PRODUCT bottom: "c2" top: "f2" inner_product_param { num_output: 4 } }
+  layers { type: CONCAT bottom: "f1" bottom: "f2" top: "both" }
+  layers { type: INNER_PRODUCT bottom: "both" top: "f" inner_product_param { num_output: 3 } }
+  layers { type: SOFTMAX bottom: "f" top: "probs" }
 )";
 
 TEST(NetBackwardTest, MatchesFiniteDifferencesThroughEveryCascadeLayerType) {

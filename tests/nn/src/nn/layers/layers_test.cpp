@@ -155,8 +155,7 @@ TEST(LayerDeathTest, SetUpRefusesWhatALayerCannotTake) {
     std::string words;
     std::vector<float> labels = {};
   } cases[] = {
-      {conv + "num_output: 1 }", two, 1,
-       "bottom.size\\(\\) == 1 .*Conv Layer takes a single blob as input."},
+      {conv + "num_output: 1 }", two, 1, "Conv Layer takes a single blob as input."},
       {conv + "}", one, 1, "Check failed: num_output_ > 0 "},
       {conv + "num_output: 2 group: 2 }", one, 1, "Check failed: channels_ % group_ == 0 "},
       {conv + "num_output: 3 group: 2 }", {{1, 4, 5, 5}}, 1,
@@ -165,30 +164,21 @@ TEST(LayerDeathTest, SetUpRefusesWhatALayerCannotTake) {
        "Padding implemented only for average pooling."},
       {"type: RELU", two, 1, "Neuron Layer takes a single blob as input."},
       {"type: RELU", one, 2, "Neuron Layer takes a single blob as output."},
-      {"type: SOFTMAX", {{1, 1, 2, 2}}, 1,
-       "channels\\(\\) >= 2 .*Softmax Layer takes more than two-channels output."},
+      {"type: SOFTMAX", {{1, 1, 2, 2}}, 1, "Softmax Layer takes more than two-channels output."},
       {"type: INNER_PRODUCT", two, 1, "IP Layer takes a single blob as input."},
       {"type: CONCAT", one, 1, "Concat Layer takes at least two blobs as input."},
       {"type: CONCAT concat_param { concat_dim: 2 }", unequal, 1,
        "For now concat_dim <=1, it can only concat num and channels"},
       {"type: CONCAT", unequal, 1, "Check failed: count_ == \\(\\*top\\)\\[0\\]->count\\(\\) "},
-      {"type: ELTWISE_PRODUCT", unequal, 1,
-       "Check failed: channels == bottom\\[i\\]->channels\\(\\) "},
-      {"type: EUCLIDEAN_LOSS", p, 0,
-       "Check failed: bottom.size\\(\\) == 2 \\(1 vs. 2\\) Loss Layer takes two blobs as input."},
-      {"type: HINGE_LOSS", p, 1, "Check failed: top->size\\(\\) == 0 .*Loss Layer takes no output.",
-       {0, 1}},
-      {"type: HINGE_LOSS", p, 0,
-       "Check failed: bottom\\[0\\]->num\\(\\) == bottom\\[1\\]->num\\(\\) .*The data and label "
-       "should have the same number.", {0, 1, 2}},
+      {"type: ELTWISE_PRODUCT", unequal, 1, "channels == bottom\\[i\\]->channels\\(\\)"},
+      {"type: EUCLIDEAN_LOSS", p, 0, "Loss Layer takes two blobs as input."},
+      {"type: HINGE_LOSS", p, 1, "Loss Layer takes no output.", {0, 1}},
+      {"type: HINGE_LOSS", p, 0, "The data and label should have the same number.", {0, 1, 2}},
       {"type: SIGMOID_CROSS_ENTROPY_LOSS", p, 0,
        "SigmoidCrossEntropyLoss Layer inputs must have same count.", {0, 1}},
-      {"type: SOFTMAX_LOSS", p, 0,
-       "Check failed: bottom.size\\(\\) == 2 .*SoftmaxLoss Layer takes two blobs as input."},
-      {"type: ACCURACY", p, 0,
-       "Check failed: top->size\\(\\) == 1 .*Accuracy Layer takes 1 output.", {0, 1}},
-      {Infogain(dir, 4, std::vector<float>(16)), p, 0,
-       "Check failed: infogain_.height\\(\\) == dim \\(4 vs. 3\\)", {0, 1}},
+      {"type: SOFTMAX_LOSS", p, 0, "SoftmaxLoss Layer takes two blobs as input."},
+      {"type: ACCURACY", p, 0, "Accuracy Layer takes 1 output.", {0, 1}},
+      {Infogain(dir, 4, std::vector<float>(16)), p, 0, "infogain_.height\\(\\) == dim", {0, 1}},
   };
   for (const auto& c : cases) {
     LayerBlobs blobs(c.bottoms, c.tops, c.labels);
