@@ -69,7 +69,8 @@ TEST(FillerTest, EachTypeFillsWithinItsLaw) {
 
 TEST(FillerDeathTest, BadParametersEndTheProcessWithTheirWords) {
   Blob<float> blob(2, 1, 2, 2);
-  EXPECT_DEATH(Fill("type: 'Gaussian'", &blob), "Check failed: false Unknown filler name: Gaussian");
+  EXPECT_DEATH(Fill("type: 'Gaussian'", &blob),
+               "Check failed: false Unknown filler name: Gaussian");
   EXPECT_DEATH(Fill("sparse: 3", &blob),
                "this->filler_param_.sparse\\(\\) == -1 .*Sparsity not supported by this Filler.");
   EXPECT_DEATH(Fill("type: 'xavier' sparse: 3", &blob), "Sparsity not supported by this Filler.");

@@ -69,63 +69,58 @@ SolverParameter Settings() {
       "base_lr: 0.05 lr_policy: 'step' stepsize: 150 gamma: 0.5 momentum: 0.9 weight_decay: 1e-5");
 }
 
-// One batch of the regression, the same for the same iteration.
-void RegressionStep(Net<float>& net, SGDSolver<float>& solver) {
-  std::mt19937 random(static_cast<unsigned>(solver.iter()));
-  std::uniform_real_distribution<float> draw(-1.0f, 1.0f);
-  float* x = net.net_input_blobs()[0]->mutable_cpu_data();
-  float* y = net.net_input_blobs()[1]->mutable_cpu_data();
-  for (int n = 0; n < 8; ++n) {
-    for (int i = 0; i < 4; ++i) {
-      x[4 * n + i] = draw(random);
+// Batches of the regression up to the given iteration, each the same for the
+// same iteration.
+void TrainUpTo(int iterations, Net<float>& net, SGDSolver<float>& solver) {
+  for (int iter = solver.iter(); iter < iterations; ++iter) {
+    std::mt19937 random(static_cast<unsigned>(iter));
+    std::uniform_real_distribution<float> draw(-1.0f, 1.0f);
+    float* x = net.net_input_blobs()[0]->mutable_cpu_data();
+    float* y = net.net_input_blobs()[1]->mutable_cpu_data();
+    for (int n = 0; n < 8; ++n) {
+      for (int i = 0; i < 4; ++i) {
+        x[4 * n + i] = draw(random);
+      }
+      y[2 * n] = 2.0f * x[4 * n] - x[4 * n + 3] + 0.5f;
+      y[2 * n + 1] = x[4 * n + 1] + 3.0f * x[4 * n + 2] - 1.0f;
     }
-    y[2 * n] = 2.0f * x[4 * n] - x[4 * n + 3] + 0.5f;
-    y[2 * n + 1] = x[4 * n + 1] + 3.0f * x[4 * n + 2] - 1.0f;
+    net.Forward();
+    net.Backward();
+    solver.ApplyUpdate();
   }
-  net.Forward();
-  net.Backward();
-  solver.ApplyUpdate();
 }
 
 TEST(SGDSolverTest, LearnsARegressionAndFollowsTheRateSchedule) {
   Net<float> net(kRegressionNet, NetDescription::kText);
   SGDSolver<float> solver(Settings(), &net);
   EXPECT_FLOAT_EQ(solver.LearningRate(), 0.05f);
-  for (int i = 0; i < 400; ++i) {
-    RegressionStep(net, solver);
-  }
+  TrainUpTo(400, net, solver);
   EXPECT_EQ(solver.iter(), 400);
   EXPECT_FLOAT_EQ(solver.LearningRate(), 0.05f * 0.25f);  // two full steps of 150
   const std::vector<float> a = {2, 0, 0, -1, 0, 1, 3, 0};
+  const std::vector<float> b = {0.5f, -1};
   for (int i = 0; i < 8; ++i) {
     EXPECT_NEAR(net.params()[0]->cpu_data()[i], a[i], 0.01f) << i;
+    EXPECT_NEAR(net.params()[1]->cpu_data()[i % 2], b[i % 2], 0.01f);
   }
-  EXPECT_NEAR(net.params()[1]->cpu_data()[0], 0.5f, 0.01f);
-  EXPECT_NEAR(net.params()[1]->cpu_data()[1], -1.0f, 0.01f);
 }
 
 TEST(SGDSolverTest, ResumingFromASnapshotGivesTheUninterruptedWeights) {
   Net<float> straight(kRegressionNet, NetDescription::kText);
   SGDSolver<float> straight_solver(Settings(), &straight);
-  for (int i = 0; i < 40; ++i) {
-    RegressionStep(straight, straight_solver);
-  }
+  TrainUpTo(40, straight, straight_solver);
   TempDir dir;
   {
     Net<float> first(kRegressionNet, NetDescription::kText);
     SGDSolver<float> solver(Settings(), &first);
-    for (int i = 0; i < 25; ++i) {
-      RegressionStep(first, solver);
-    }
+    TrainUpTo(25, first, solver);
     solver.Snapshot(dir.path() + "/w", dir.path() + "/s");
   }
   Net<float> resumed(kRegressionNet, NetDescription::kText);
   SGDSolver<float> solver(Settings(), &resumed);
   solver.Restore(dir.path() + "/s");
   EXPECT_EQ(solver.iter(), 25);
-  for (int i = 25; i < 40; ++i) {
-    RegressionStep(resumed, solver);
-  }
+  TrainUpTo(40, resumed, solver);
   for (size_t p = 0; p < straight.params().size(); ++p) {
     EXPECT_EQ(Values(*resumed.params()[p]), Values(*straight.params()[p])) << p;
   }

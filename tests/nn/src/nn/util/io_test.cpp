@@ -48,12 +48,7 @@ TEST(IoTest, TextFileAndTextInMemoryGiveTheSameDescription) {
 }
 
 TEST(IoTest, BinaryFilesRoundTripAndMayPassTheOldDefaultLimit) {
-  NetParameter weights;
-  weights.add_layers()->set_name("fc");
-  BlobProto* blob = weights.mutable_layers(0)->add_blobs();
-  blob->set_width(2);
-  blob->add_data(0.5f);
-  blob->add_data(-1.5f);
+  const auto weights = Parse<NetParameter>("layers { name: 'fc' blobs { width: 2 data: [1, 2] } }");
   TempDir dir;
   NetParameter read;
   ReadNetParamsFromBinaryFile(dir.write("weights", weights.SerializeAsString()), &read);
@@ -170,8 +165,6 @@ TEST(UpgradeProtoTest, OldParametersGoToTheirPlaceOrAreLoggedAndDropped) {
        "type: WINDOW_DATA window_data_param { source: 'w' mean_file: 'm' batch_size: 8 crop_size: 9"
        " mirror: true fg_threshold: 0.6 bg_threshold: 0.4 fg_fraction: 0.3 context_pad: 16"
        " crop_mode: 'square' }", {}},
-      {"type: 'hdf5_output' hdf5_output_param { file_name: 'f' }",
-       "type: HDF5_OUTPUT hdf5_output_param { file_name: 'f' }", {}},
       // Places the new message has but the upgrade doesn't give.
       {"type: 'pool' pad: 1", "type: POOLING", {"Unknown parameter pad for layer type pool"}},
       {"type: 'data' shuffle_images: true", "type: DATA",

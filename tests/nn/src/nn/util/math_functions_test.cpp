@@ -4,25 +4,12 @@
 
 #include <cmath>
 #include <limits>
-#include <string>
 #include <vector>
 
 namespace nn {
 namespace {
 
-TEST(MathFunctionsTest, VectorEdgesSignAndIndexOfLargestMagnitude) {
-  // Bad arguments are reported and leave the output alone; no work, no word.
-  std::vector<float> y = {7, 7};
-  testing::internal::CaptureStderr();
-  vsAdd(-1, y.data(), y.data(), y.data());
-  vsSub(2, nullptr, y.data(), y.data());
-  vsExp(0, nullptr, nullptr);
-  const std::string log = testing::internal::GetCapturedStderr();
-  EXPECT_EQ(y, (std::vector<float>{7, 7}));
-  EXPECT_NE(log.find("vsAdd"), std::string::npos);
-  EXPECT_NE(log.find("vsSub"), std::string::npos);
-  EXPECT_EQ(log.find("vsExp"), std::string::npos);
-
+TEST(MathFunctionsTest, SignAndIndexOfLargestMagnitude) {
   const std::vector<float> x = {-2.0f, 0.0f, 3.0f, std::numeric_limits<float>::quiet_NaN(), -0.0f};
   std::vector<float> sign(5);
   nn_cpu_sign(5, x.data(), sign.data());
@@ -32,18 +19,12 @@ TEST(MathFunctionsTest, VectorEdgesSignAndIndexOfLargestMagnitude) {
   EXPECT_EQ(cblas_isamax(0, tie.data(), 1), 0u);
 }
 
-TEST(MathFunctionsTest, RandomDrawsStayInTheirRanges) {
+TEST(MathFunctionsTest, DegenerateRandomDrawsStayInTheirRanges) {
   std::vector<float> r(1000);
   nn_rng_uniform(1000, 1.0f, 1.0f, r.data());
   for (float v : r) {
     ASSERT_TRUE(v == 1.0f || v == std::nextafter(1.0f, 2.0f)) << v;
   }
-  nn_rng_gaussian(1000, 5.0f, 0.5f, r.data());
-  double mean = 0;
-  for (float v : r) {
-    mean += v / 1000.0;
-  }
-  EXPECT_NEAR(mean, 5.0, 0.1);
   std::vector<int> bits(500, 7);
   nn_rng_bernoulli(500, 1.0, bits.data());
   EXPECT_EQ(bits, std::vector<int>(500, 1));
