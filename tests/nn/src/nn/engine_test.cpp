@@ -5,6 +5,7 @@
 #include <algorithm>
 #include <cmath>
 #include <cstdlib>
+#include <limits>
 #include <memory>
 #include <numeric>
 #include <string>
@@ -12,6 +13,7 @@
 
 #include "gradient_checker.h"
 #include "nn/filler.h"
+#include "nn/util/math_functions.h"
 
 namespace nn {
 namespace {
@@ -81,6 +83,43 @@ TEST(FillerDeathTest, BadParametersEndTheProcessWithTheirWords) {
   EXPECT_DEATH(Fill("", &empty), "Check failed: data_ ");
   EXPECT_DEATH(Fill("type: 'uniform'", &empty), "Check failed: blob->count\\(\\) ");
   EXPECT_DEATH(Fill("type: 'xavier'", &empty), "Check failed: blob->count\\(\\) ");
+}
+
+TEST(MathFunctionsTest, SignAndIndexOfLargestMagnitude) {
+  const std::vector<float> x = {-2.0f, 0.0f, 3.0f, std::numeric_limits<float>::quiet_NaN(), -0.0f};
+  std::vector<float> sign(5);
+  nn_cpu_sign(5, x.data(), sign.data());
+  EXPECT_EQ(sign, (std::vector<float>{-1, 0, 1, 0, 0}));
+  const std::vector<float> tie = {0.1f, -0.5f, 0.2f, 0.5f};
+  EXPECT_EQ(cblas_isamax(4, tie.data(), 1), 1u) << "the lowest index wins a tie";
+  EXPECT_EQ(cblas_isamax(0, tie.data(), 1), 0u);
+}
+
+TEST(MathFunctionsTest, DegenerateRandomDrawsStayInTheirRanges) {
+  std::vector<float> r(1000);
+  nn_rng_uniform(1000, 1.0f, 1.0f, r.data());
+  for (float v : r) {
+    ASSERT_TRUE(v == 1.0f || v == std::nextafter(1.0f, 2.0f)) << v;
+  }
+  std::vector<int> bits(500, 7);
+  nn_rng_bernoulli(500, 1.0, bits.data());
+  EXPECT_EQ(bits, std::vector<int>(500, 1));
+  nn_rng_bernoulli(500, 0.0f, bits.data());
+  EXPECT_EQ(bits, std::vector<int>(500, 0));
+}
+
+TEST(MathFunctionsDeathTest, RandomDrawsAndSignCheckTheirArguments) {
+  std::vector<float> r(4);
+  std::vector<int> bits(4);
+  EXPECT_DEATH(nn_rng_uniform(-1, 0, 1, r.data()), "Check failed: n >= 0 ");
+  EXPECT_DEATH(nn_rng_uniform(4, 0, 1, nullptr), "Check failed: r ");
+  EXPECT_DEATH(nn_rng_uniform(4, 2, 1, r.data()), "Check failed: a <= b ");
+  EXPECT_DEATH(nn_rng_gaussian(4, 0, 0, r.data()), "Check failed: sigma > 0 ");
+  EXPECT_DEATH(nn_rng_gaussian(4, 0, std::nanf(""), r.data()), "Check failed: sigma > 0 ");
+  EXPECT_DEATH(nn_rng_bernoulli(4, -0.5, bits.data()), "Check failed: p >= 0 ");
+  EXPECT_DEATH(nn_rng_bernoulli(4, 1.5f, bits.data()), "Check failed: p <= 1 ");
+  EXPECT_DEATH(nn_cpu_sign(0, r.data(), r.data()), "Check failed: n > 0 ");
+  EXPECT_DEATH(nn_cpu_sign(4, nullptr, r.data()), "Check failed: x ");
 }
 
 }  // namespace

@@ -10,6 +10,7 @@
 #include "nn/common_layers.h"
 #include "nn/engine.h"
 #include "nn/neuron_layers.h"
+#include "nn/util/math_functions.h"
 
 namespace nn {
 namespace {
@@ -43,6 +44,26 @@ TEST(ConvolutionLayerTest, GroupsSeeTheirOwnChannelsThroughPaddingAndStride) {
   std::vector<int> shape;
   ForwardOn(Conv("num_output: 1 kernel_size: 3 stride: 2"), {1, 1, 2, 2}, Ramp(4), &shape);
   EXPECT_EQ(shape, (std::vector<int>{1, 1, 1, 1}));
+}
+
+TEST(MathFunctionsTest, Im2colUnfoldsWithZeroPaddingAndCol2imAddsBack) {
+  // The 2x2 image 1, 2, 3, 4 under 2x2 windows, padding 1, stride 2: each
+  // window sees one pixel, in the opposite corner.
+  const std::vector<float> image = {1, 2, 3, 4};
+  std::vector<float> col(16, 99.0f);
+  im2col(image.data(), 1, 2, 2, 2, 1, 2, col.data());
+  EXPECT_EQ(col, (std::vector<float>{0, 0, 0, 4, 0, 0, 3, 0, 0, 2, 0, 0, 1, 0, 0, 0}));
+  std::vector<float> back(4, 42.0f);
+  col2im(col.data(), 1, 2, 2, 2, 1, 2, back.data());
+  EXPECT_EQ(back, image) << "the image is cleared first and padding cells skipped";
+
+  // Applied to ones, col2im(im2col(.)) counts the windows covering each pixel.
+  std::vector<float> ones(16, 1.0f);
+  std::vector<float> windows(4 * 9);
+  im2col(ones.data(), 1, 4, 4, 3, 0, 1, windows.data());
+  std::vector<float> counts(16);
+  col2im(windows.data(), 1, 4, 4, 3, 0, 1, counts.data());
+  EXPECT_EQ(counts, (std::vector<float>{1, 2, 2, 1, 2, 4, 4, 2, 2, 4, 4, 2, 1, 2, 2, 1}));
 }
 
 TEST(PoolingLayerTest, SizesRoundUpAndAveragesCountPadding) {
@@ -193,15 +214,6 @@ TEST(NeuronLayersTest, ForwardFormulasAndTheirOverflows) {
               p.expected)
         << p.param;
   }
-
-  // In place, ReLU overwrites its bottom.
-  Blob<float> y(1, 1, 1, 4);
-  SetValues(&y, {-1, 2, -3, 4});
-  Blobs same = {&y};
-  ReLULayer<float> relu_in_place{LayerParameter()};
-  relu_in_place.SetUp(same, &same);
-  relu_in_place.Forward(same, &same);
-  EXPECT_EQ(Values(y), (std::vector<float>{0, 2, 0, 4}));
 }
 
 TEST(NeuronLayersTest, DropoutScalesSurvivorsInTrainingAndCopiesInTesting) {

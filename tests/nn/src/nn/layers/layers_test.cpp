@@ -75,7 +75,6 @@ TEST(LayerGradientTest, BackwardMatchesFiniteDifferencesForEveryLayerType) {
       {"type: TANH", x, 1, 1e-3f},
       {"type: BNLL", x, 1, 1e-3f},
       {"type: POWER power_param { power: 2 scale: 0.7 shift: 0.4 }", x, 1, 1e-3f},
-      {"type: POWER power_param { power: -0.75 scale: 0.3 shift: 1 }", x, 1, 1e-3f},
       {"type: POWER power_param { power: 1.5 scale: 0.5 }", x, 1, 1e-3f},
       {"type: POWER power_param { power: 1 scale: 2 shift: 1 }", x, 1, 1e-3f},
       {"type: POOLING pooling_param { kernel_size: 3 stride: 2 }", {{2, 2, 7, 6}}, 1, 1e-3f},
