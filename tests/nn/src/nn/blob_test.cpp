@@ -77,10 +77,8 @@ TEST(BlobTest, ReshapeGivesFreshMemoryWhileSharersKeepTheOld) {
 
 TEST(BlobTest, ShapeRewriteKeepsTheBufferAndFindsOldBytesWhenRegrown) {
   Blob<float> blob(1, 2, 4, 4);
-  float* data = blob.mutable_cpu_data();
-  for (int i = 0; i < blob.count(); ++i) {
-    data[i] = static_cast<float>(i);
-  }
+  SetValues(&blob, Ramp(32));
+  const float* data = blob.cpu_data();
   blob.RewriteShape(1, 2, 2, 3);
   EXPECT_EQ(blob.count(), 12);
   EXPECT_EQ(blob.data()->size(), 32 * sizeof(float));
@@ -114,10 +112,8 @@ TEST(BlobTest, OffsetChecksBothEndsOfNButOnlyTheUpperEndOfTheOthers) {
 
 TEST(BlobTest, ProtoRoundTripCarriesShapeDataAndDiffOnRequest) {
   Blob<float> source(1, 2, 1, 3);
-  for (int i = 0; i < 6; ++i) {
-    source.mutable_cpu_data()[i] = 0.5f * i;
-    source.mutable_cpu_diff()[i] = -1.0f * i;
-  }
+  SetValues(&source, Ramp(6));
+  std::fill(source.mutable_cpu_diff(), source.mutable_cpu_diff() + 6, -1.0f);
   BlobProto without_diff;
   source.ToProto(&without_diff);
   EXPECT_EQ(without_diff.diff_size(), 0);
@@ -128,8 +124,7 @@ TEST(BlobTest, ProtoRoundTripCarriesShapeDataAndDiffOnRequest) {
   copy.FromProto(with_diff);
   EXPECT_EQ(Shape(copy), (std::vector<int>{1, 2, 1, 3}));
   EXPECT_EQ(Values(copy), Values(source));
-  EXPECT_EQ(std::vector<float>(copy.cpu_diff(), copy.cpu_diff() + 6),
-            std::vector<float>(source.cpu_diff(), source.cpu_diff() + 6));
+  EXPECT_EQ(std::vector<float>(copy.cpu_diff(), copy.cpu_diff() + 6), std::vector<float>(6, -1));
   copy.FromProto(without_diff);
   EXPECT_EQ(copy.diff()->head(), SyncedMemory::UNINITIALIZED);
   EXPECT_DEATH(copy.FromProto(BlobProto()), "Check failed: data_ ");

@@ -116,30 +116,6 @@ TEST(LayerGradientTest, BackwardMatchesFiniteDifferencesForEveryLayerType) {
   }
 }
 
-TEST(LayerTest, AlterInputShapeRewritesTheTopWithoutTouchingMemory) {
-  const struct {
-    const char* layer;
-    std::vector<int> before, after, top;
-  } cases[] = {
-      {"type: CONVOLUTION convolution_param { num_output: 3 kernel_size: 3 }", {1, 2, 10, 10},
-       {1, 2, 5, 4}, {1, 3, 3, 2}},
-      // ceil(3 / 2) + 1 rows, ceil(2 / 2) + 1 columns.
-      {"type: POOLING pooling_param { kernel_size: 3 stride: 2 }", {1, 1, 10, 10}, {1, 1, 6, 5},
-       {1, 1, 3, 2}},
-      {"type: LRN", {1, 4, 6, 6}, {1, 4, 2, 3}, {1, 4, 2, 3}},
-      {"type: SOFTMAX", {1, 2, 3, 4}, {1, 2, 2, 3}, {1, 2, 2, 3}},
-  };
-  for (const auto& c : cases) {
-    Blob<float> in(c.before[0], c.before[1], c.before[2], c.before[3]);
-    OneLayer layer(c.layer, &in);
-    const size_t bytes = layer.out.data()->size();
-    in.RewriteShape(c.after[0], c.after[1], c.after[2], c.after[3]);
-    layer.layer->AlterInputShape(c.after[3], c.after[2], layer.bottom, &layer.top);
-    EXPECT_EQ(Shape(layer.out), c.top) << c.layer;
-    EXPECT_EQ(layer.out.data()->size(), bytes) << c.layer;
-  }
-}
-
 TEST(LayerDeathTest, SetUpRefusesWhatALayerCannotTake) {
   TempDir dir;
   const std::vector<std::vector<int>> one = {{1, 3, 5, 5}};

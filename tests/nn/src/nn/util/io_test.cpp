@@ -251,8 +251,7 @@ TEST(NnProtoTest, DefaultsAreThoseTheTrainedModelsAssume) {
 }
 
 LayerParameter Param(int type) {
-  LayerParameter param;
-  param.set_name("x");
+  LayerParameter param = Parse<LayerParameter>("name: 'x'");
   param.set_type(static_cast<LayerParameter::LayerType>(type));
   return param;
 }
