@@ -134,9 +134,7 @@ inline void CheckGradient(Layer<float>* layer, const Blobs& bottom, Blobs* top, 
   CheckDerivatives(checked, [&] {
     double sum = layer->Forward(bottom, top);
     for (size_t t = 0; t < top->size(); ++t) {
-      for (int i = 0; i < (*top)[t]->count(); ++i) {
-        sum += double(weights[t][i]) * (*top)[t]->cpu_data()[i];
-      }
+      sum += std::inner_product(weights[t].begin(), weights[t].end(), (*top)[t]->cpu_data(), 0.0);
     }
     return sum;
   }, step, tolerance);

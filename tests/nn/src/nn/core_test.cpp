@@ -46,7 +46,6 @@ TEST(SyncedMemoryTest, ZeroedBufferAtFirstTouchOnlyAndAdoptedBuffersAreNotOwned)
 
 TEST(BlobTest, DataAndDiffReadZerosAndAllocateOnlyWhenTouched) {
   Blob<float> blob(2, 3, 4, 5);
-  EXPECT_EQ(blob.count(), 120);
   EXPECT_EQ(blob.data()->size(), 120 * sizeof(float));
   EXPECT_EQ(Values(blob), std::vector<float>(120, 0.0f));
   EXPECT_EQ(blob.diff()->head(), SyncedMemory::UNINITIALIZED) << "touching data leaves diff alone";

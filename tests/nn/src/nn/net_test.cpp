@@ -36,12 +36,9 @@ TEST(NetTest, FFAddsTheFirstRunResponseFlatEvenAfterAShrink) {
   EXPECT_EQ(input->cpu_data()[15], 100.0f);
   SetValues(input, Ramp(16));
   const Blob<float>& out = *net.FF()[0];
-  // Window sums of the ramp 0..15: 45, 54, 81, 90.
-  const float sums[] = {45, 54, 81, 90};
-  for (int i = 0; i < 4; ++i) {
-    EXPECT_EQ(out.cpu_data()[i], sums[i] + 0.5f + 900.5f) << "bias counted twice";
-    EXPECT_EQ(out.cpu_data()[4 + i], 2 * sums[i] - 1.0f + 1799.0f);
-  }
+  // Window sums of the ramp 0..15 are 45, 54, 81, 90; the bias counts twice.
+  EXPECT_EQ(Values(out), (std::vector<float>{45 + 901, 54 + 901, 81 + 901, 90 + 901, 90 + 1798,
+                                             108 + 1798, 162 + 1798, 180 + 1798}));
   // At 3x3 each channel has one cell; element 1 (channel 1) meets element 1
   // of the stored response, which belongs to channel 0.
   net.AlterInputShape(3, 3);
@@ -53,13 +50,11 @@ TEST(NetTest, FFAddsTheFirstRunResponseFlatEvenAfterAShrink) {
 TEST(NetDeathTest, FirstRunStopsAtTheFirstConvolutionWhichFFWantsFirst) {
   Net<float> net(R"(
     input: "data" input_dim: 1 input_dim: 1 input_dim: 6 input_dim: 6
-    layers { name: "pool" type: POOLING bottom: "data" top: "pool"
-             pooling_param { pool: AVE kernel_size: 2 stride: 2 } }
-    layers { name: "conv" type: CONVOLUTION bottom: "pool" top: "conv"
-             convolution_param { num_output: 2 kernel_size: 1
-               weight_filler { type: "constant" value: 1 } } }
-    layers { name: "relu" type: RELU bottom: "conv" top: "conv" }
-    layers { name: "probs" type: SOFTMAX bottom: "conv" top: "probs" })",
+    layers { type: POOLING bottom: "data" top: "pool" pooling_param { pool: AVE kernel_size: 2 } }
+    layers { type: CONVOLUTION bottom: "pool" top: "conv" convolution_param { num_output: 2
+             kernel_size: 1 weight_filler { type: "constant" value: 1 } } }
+    layers { type: RELU bottom: "conv" top: "conv" }
+    layers { type: SOFTMAX bottom: "conv" top: "probs" })",
                  NetDescription::kText);
   net.FirstRun();
   EXPECT_EQ(net.blobs()[2]->cpu_data()[0], 100.0f) << "conv ran";
@@ -168,11 +163,9 @@ const char kTwoLayerNet[] = R"(
 )";
 
 TEST(NetTest, TrainedLayersAreCopiedByNameFromAWeightFile) {
-  NetParameter weights;
-  LayerParameter* unknown = weights.add_layers();
-  unknown->set_name("loss");  // not in the net: skipped
-  *unknown->add_blobs() = MakeBlob(1, 1, 1, 1, {5});
-  for (float value : {1.0f, 2.0f}) {  // the later of two namesakes wins
+  // A layer the net lacks is skipped; of two namesakes the later wins.
+  auto weights = Parse<NetParameter>("layers { name: 'loss' blobs { width: 1 data: 5 } }");
+  for (float value : {1.0f, 2.0f}) {
     LayerParameter* ip = weights.add_layers();
     ip->set_name("ip");
     *ip->add_blobs() = MakeBlob(1, 1, 2, 3, std::vector<float>(6, value));

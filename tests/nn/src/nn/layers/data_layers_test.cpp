@@ -58,17 +58,6 @@ std::string Mean(const TempDir& dir, int channels, int height, int width,
   return " mean_file: '" + dir.path() + "/mean' ";
 }
 
-TEST(ReadImageToDatumTest, PlanesComeLastChannelFirstAndResizeSwapsTheSizes) {
-  Datum datum = ByteDatum(1, 1, 1, 9, 7);
-  // new_height becomes the width.
-  EXPECT_TRUE(ReadImageToDatum(cv::Mat(5, 5, CV_8UC3, cv::Scalar(10, 20, 30)), 4, 2, &datum));
-  EXPECT_EQ(std::vector<int>({datum.channels(), datum.height(), datum.width(), datum.label()}),
-            std::vector<int>({3, 2, 4, 0}));
-  EXPECT_EQ(datum.data(), std::string(8, 30) + std::string(8, 20) + std::string(8, 10));
-  EXPECT_DEATH(ReadImageToDatum(cv::Mat(2, 2, CV_8UC1), 0, 0, &datum),
-               "ReadImageToDatum takes 8-bit images of three channels");
-}
-
 TEST(DataLayerTest, FeedsANetFromTheDrawnRecordAcrossTheEndOfTheDatabase) {
   TempDir dir;
   const std::string common = "batch_size: 2 scale: 0.5" + Mean(dir, 2, 1, 2, {1, 2, 3, 4});
@@ -198,13 +187,21 @@ TEST(InMemoryDataLayersDeathTest, ImagesAreServedInTurnAndBadSettingsOrNoArrayAr
     layer.SetUp({}, &top);
     layer.Forward({}, &top);
   };
+  // Planes come last channel first, and new_height becomes the width.
+  Datum datum = ByteDatum(1, 1, 1, 9, 7);
+  EXPECT_TRUE(ReadImageToDatum(cv::Mat(5, 5, CV_8UC3, cv::Scalar(10, 20, 30)), 4, 2, &datum));
+  EXPECT_EQ(std::vector<int>({datum.channels(), datum.height(), datum.width(), datum.label()}),
+            std::vector<int>({3, 2, 4, 0}));
+  EXPECT_EQ(datum.data(), std::string(8, 30) + std::string(8, 20) + std::string(8, 10));
+  EXPECT_DEATH(ReadImageToDatum(cv::Mat(2, 2, CV_8UC1), 0, 0, &datum),
+               "ReadImageToDatum takes 8-bit images of three channels");
+
   // SetUp shapes a square of new_height; the worker's records are 2 wide and
   // 3 high, of which the first 12 bytes are used.
   run("batch_size: 4 new_height: 2 new_width: 3", 3);
   EXPECT_EQ(Shape(data), std::vector<int>({4, 3, 2, 2}));
   EXPECT_EQ(Values(labels), std::vector<float>(4, 0.0f));
   for (int item = 0; item < 4; ++item) {
-    Datum datum;
     ReadImageToDatum(*images[item % 3], 2, 3, &datum);
     const auto* bytes = reinterpret_cast<const unsigned char*>(datum.data().data());
     EXPECT_EQ(std::vector<float>(data.cpu_data() + item * 12, data.cpu_data() + (item + 1) * 12),

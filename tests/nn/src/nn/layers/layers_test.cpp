@@ -163,14 +163,11 @@ TEST(LayerDeathTest, SetUpRefusesWhatALayerCannotTake) {
   in_place.top.push_back(in_place.bottom[0]);
   EXPECT_DEATH(Make("type: SPLIT")->SetUp(in_place.bottom, &in_place.top),
                "Only 0th top blob may be in place.");
-  EXPECT_DEATH(
-      {
-        LayerBlobs blobs({{1, 4, 5, 5}}, 1);
-        const auto grouped = Make(conv + "num_output: 2 group: 2 }");
-        grouped->SetUp(blobs.bottom, &blobs.top);
-        static_cast<ConvolutionLayer<float>*>(grouped.get())->CheckBinarization();
-      },
-      "binarization supports only single group.");
+  Blob<float> four(1, 4, 5, 5);
+  EXPECT_DEATH(static_cast<ConvolutionLayer<float>*>(
+                   OneLayer(conv + "num_output: 2 group: 2 }", &four).layer.get())
+                   ->CheckBinarization(),
+               "binarization supports only single group.");
   EXPECT_DEATH(OneLayer("type: POOLING pooling_param { pool: STOCHASTIC kernel_size: 2 }",
                         in_place.bottom[0]).Forward(),
                "Not Implemented Yet");

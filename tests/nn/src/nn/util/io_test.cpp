@@ -162,12 +162,6 @@ TEST(UpgradeProtoTest, OldParametersGoToTheirPlaceOrAreLoggedAndDropped) {
        " rand_skip: 9 shuffle_images: true new_height: 30 new_width: 40 new_num: 3 new_channels: 4",
        "type: IMAGE_DATA image_data_param { source: 'l' scale: 2 mean_file: 'm' batch_size: 5"
        " crop_size: 6 mirror: true rand_skip: 9 shuffle: true new_height: 30 new_width: 40 }", {}},
-      {"type: 'window_data' source: 'w' meanfile: 'm' batchsize: 8 cropsize: 9 mirror: true"
-       " det_fg_threshold: 0.6 det_bg_threshold: 0.4 det_fg_fraction: 0.3 det_context_pad: 16"
-       " det_crop_mode: 'square'",
-       "type: WINDOW_DATA window_data_param { source: 'w' mean_file: 'm' batch_size: 8 crop_size: 9"
-       " mirror: true fg_threshold: 0.6 bg_threshold: 0.4 fg_fraction: 0.3 context_pad: 16"
-       " crop_mode: 'square' }", {}},
       // Places the new message has but the upgrade doesn't give.
       {"type: 'pool' pad: 1", "type: POOLING", {"Unknown parameter pad for layer type pool"}},
       {"type: 'data' shuffle_images: true", "type: DATA",
@@ -242,12 +236,8 @@ TEST(NnProtoTest, DefaultsAreThoseTheTrainedModelsAssume) {
   ExpectDefaults<PowerParameter>("power: 1 scale: 1 shift: 0");
   ExpectDefaults<DataParameter>("scale: 1 crop_size: 0 mirror: false rand_skip: 0");
   ExpectDefaults<ImageDataParameter>("shuffle: false new_height: 0 new_width: 0");
-  ExpectDefaults<WindowDataParameter>("fg_threshold: 0.5 fg_fraction: 0.25 crop_mode: 'warp'");
-  ExpectDefaults<SolverParameter>("solver_mode: GPU random_seed: -1");
-  ExpectDefaults<NetParameter>("force_backward: false");
   ExpectDefaults<V0LayerParameter>(
       "biasterm: true pool: MAX local_size: 5 det_crop_mode: 'warp' concat_dim: 1");
-  EXPECT_FALSE(ConvolutionParameter().has_kernel_size());
 }
 
 LayerParameter Param(int type) {
