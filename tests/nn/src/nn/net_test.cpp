@@ -120,11 +120,9 @@ TEST(NetTest, OutputsAreTheUnconsumedBlobsInNameOrder) {
   // alpha feeds two layers, so a split sits behind it.
   EXPECT_EQ(net.layer_names(),
             (std::vector<std::string>{"z", "z2", "a", "a_alpha_0_split", "m", "m2", "b"}));
-  const auto& names = net.blob_names();
-  const auto blob = [&](const std::string& name) {
-    return net.blobs()[std::find(names.begin(), names.end(), name) - names.begin()].get();
-  };
-  EXPECT_EQ(net.output_blobs(), (Blobs{blob("beta"), blob("mid")}));
+  EXPECT_EQ(net.blob_names(), (std::vector<std::string>{"data", "zeta", "alpha",
+                                                        "a_alpha_0_split_1", "mid", "beta"}));
+  EXPECT_EQ(net.output_blobs(), (Blobs{net.blobs()[5].get(), net.blobs()[4].get()}));
   EXPECT_FALSE(net.output_blob()) << "no blob is named probs";
 }
 
@@ -174,8 +172,7 @@ TEST(NetTest, TrainedLayersAreCopiedByNameFromAWeightFile) {
   TempDir dir;
   Net<float> net(kTwoLayerNet, NetDescription::kText);
   net.CopyTrainedLayersFrom(dir.write("weights", weights.SerializeAsString()));
-  std::fill(net.net_input_blobs()[0]->mutable_cpu_data(),
-            net.net_input_blobs()[0]->mutable_cpu_data() + 6, 1.0f);
+  SetValues(net.net_input_blobs()[0], std::vector<float>(6, 1.0f));
   // ip: (6, 8) per image; ip2 keeps its filled weights: 3 * 14 + 0 = 42.
   EXPECT_EQ(Values(*net.Forward()[0]), (std::vector<float>{42, 42}));
 

@@ -89,9 +89,8 @@ TEST(DataLayerTest, FeedsANetFromTheDrawnRecordAcrossTheEndOfTheDatabase) {
       EXPECT_EQ(labels.cpu_data()[item], record);
     }
   }
-  EXPECT_EQ(std::vector<float>(net.output_blobs()[1]->cpu_data(),
-                               net.output_blobs()[1]->cpu_data() + 4),
-            std::vector<float>({-1.25f, -0.875f, 148.5f, 0}));
+  EXPECT_EQ(Values(*net.output_blobs()[1]),
+            std::vector<float>({-1.25f, -0.875f, 148.5f, 0, -1.25f, -0.875f, 148.5f, 0}));
 }
 
 // A worker still reading when its layer goes must be joined before the
