@@ -15,9 +15,7 @@ inline BlobProto MakeBlob(int num, int channels, int height, int width,
   blob.set_channels(channels);
   blob.set_height(height);
   blob.set_width(width);
-  for (float v : data) {
-    blob.add_data(v);
-  }
+  blob.mutable_data()->Add(data.begin(), data.end());
   return blob;
 }
 
