@@ -32,9 +32,7 @@ std::string ReadFile(const std::string& path) {
 int RunTool(const std::string& tool, const std::vector<std::string>& args, const TempDir& dir,
             std::string* errors) {
   std::string command = tool;
-  for (const std::string& arg : args) {
-    command += " '" + arg + "'";
-  }
+  for (const std::string& arg : args) command += " '" + arg + "'";
   const int status = std::system((command + " >/dev/null 2>'" + dir.path() + "/stderr'").c_str());
   *errors = ReadFile(dir.path() + "/stderr");
   return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
@@ -59,9 +57,7 @@ TEST(UpgradeNetProtoTest, ToolsUpgradeOldFilesAndKeepCurrentOnes) {
     SCOPED_TRACE(tool);
     TempDir dir;
     std::string old_file = v0.SerializeAsString();
-    if (!binary) {
-      google::protobuf::TextFormat::PrintToString(v0, &old_file);
-    }
+    if (!binary) google::protobuf::TextFormat::PrintToString(v0, &old_file);
     const std::string upgraded = dir.path() + "/upgraded";
     std::string errors;
     EXPECT_EQ(RunTool(tool, {dir.write("old", old_file), upgraded}, dir, &errors), 0);

@@ -28,7 +28,7 @@ std::string Int32s(std::vector<int32_t> values) {
   return std::string(reinterpret_cast<const char*>(values.data()), values.size() * 4);
 }
 
-TEST(SdmModelTest, WrittenModelReadsBackSectionBySectionAndATailIsIgnored) {
+TEST(SdmModelTest, WrittenModelReadsBackWholeAndATailIsIgnored) {
   SDMModel written;
   written.stageMatrices.push_back(Sequence(1, 1, 0.0f));
   written.stageBiases = {Sequence(1, 4, 10.0f), Sequence(1, 4, 20.0f)};
@@ -46,17 +46,11 @@ TEST(SdmModelTest, WrittenModelReadsBackSectionBySectionAndATailIsIgnored) {
   TempDir dir;
   SDMModel model;
   ASSERT_TRUE(readSDMModel(dir.write("model.bin", out.str() + "xy"), model));
-  EXPECT_EQ(model.stageMatrices.size(), 1u);
-  ASSERT_EQ(model.stageBiases.size(), 2u);
-  EXPECT_EQ(Bytes(model.stageBiases[1]), Bytes(written.stageBiases[1]));
-  EXPECT_EQ(model.meanShape, written.meanShape);
-  EXPECT_EQ(model.auxShape, written.auxShape);
-  ASSERT_EQ(model.stageMaps.size(), 2u);
-  EXPECT_EQ(Bytes(model.stageMaps[1]), Bytes(written.stageMaps[1]));
+  std::ostringstream again;
+  writeSDMModel(again, model);
+  EXPECT_EQ(again.str(), out.str());
+  EXPECT_EQ(Bytes(model.stageMaps.at(1)), Bytes(written.stageMaps[1]));
   EXPECT_EQ(model.stageLevels, written.stageLevels);
-  EXPECT_EQ(model.modelFlag, 5);
-  EXPECT_EQ(model.scalesPerOctave, 4);
-  EXPECT_EQ(model.faceWidth, 120);
 }
 
 // Six zero counts, the discarded integer, flag, scales per octave, width.
