@@ -7,6 +7,7 @@
 #include <cstdint>
 #include <cstring>
 #include <random>
+#include <tuple>
 #include <utility>
 #include <vector>
 
@@ -21,59 +22,6 @@ std::vector<uint8_t> RandomPixels(size_t count, uint32_t seed) {
   std::vector<uint8_t> pixels(count);
   for (uint8_t& p : pixels) p = static_cast<uint8_t>(generator());
   return pixels;
-}
-
-// The descriptor as a plain transcription: range tests per corner, the weight
-// and ratio per sample, the gradient from the level's pixels.
-void ReferenceDescriptor(const SiftPyramid& pyramid, float x, float y, int s, float& norm, uint8_t out[128]) {
-  float h[128] = {};
-  const int xi = static_cast<int>(static_cast<double>(x) + 0.5);
-  const int yi = static_cast<int>(static_cast<double>(y) + 0.5);
-  const float ox = static_cast<float>(xi) - x;
-  const float oy = static_cast<float>(yi) - y;
-  float power = 1.0f;  // k^s by repeated squaring
-  float base = pyramid.sigmaRatio();
-  for (int e = s; e > 0; e >>= 1, base *= base) power *= e & 1 ? base : 1.0f;
-  const float binW = power * 0.8f * 4.0f;
-  const int R = static_cast<int>(static_cast<double>(binW) * std::sqrt(2.0) * 4.0 * 0.5 + 0.5);
-  const int width = static_cast<int>(pyramid.width()), height = static_cast<int>(pyramid.height());
-  const FloatImage& image = pyramid.level(s);
-  for (int dy = std::max(-R, 1 - yi); dy <= std::min(height - yi - 2, R); ++dy) {
-    for (int dx = std::max(-R, 1 - xi); dx <= std::min(width - xi - 2, R); ++dx) {
-      const int cx = xi + dx, cy = yi + dy;
-      const GradientCell cell = gradientCell(image.row(cy)[cx + 1] - image.row(cy)[cx - 1],
-                                             image.row(cy + 1)[cx] - image.row(cy - 1)[cx]);
-      const float fy = (dy + oy) / binW - 0.5f;
-      const float fx = (dx + ox) / binW - 0.5f;
-      const int row0 = static_cast<int>(std::floor(fy));
-      const int col0 = static_cast<int>(std::floor(fx));
-      const float ty = fy - row0;
-      const float tx = fx - col0;
-      const float m = cell.magnitude * cell.mainWeight;
-      const float ratio = cell.secondWeight / (cell.mainWeight + 0.000001f);
-      // Corners (row0, col0), (row0 + 1, col0), (row0, col0 + 1), (row0 + 1, col0 + 1).
-      for (int corner = 0; corner < 4; ++corner) {
-        const int row = row0 + (corner & 1);
-        const int col = col0 + (corner >> 1);
-        if (row < -2 || row > 1 || col < -2 || col > 1) continue;
-        const float weight = std::fabs(m * (corner >> 1 ? tx : 1 - tx) * (corner & 1 ? ty : 1 - ty));
-        h[((row + 2) * 4 + (col + 2)) * 8 + cell.mainBin] += weight;
-        h[((row + 2) * 4 + (col + 2)) * 8 + cell.secondBin] += weight * ratio;
-      }
-    }
-  }
-  // Four interleaved partial sums, the library's (free) order of the norm.
-  auto length = [](const float* v) {
-    float sums[4] = {0, 0, 0, 0};
-    for (int i = 0; i < 128; ++i) sums[i % 4] += v[i] * v[i];
-    return std::sqrt((sums[0] + sums[1]) + (sums[2] + sums[3]));
-  };
-  const float total = length(h);
-  norm = total > 0.5f ? total : 0.0f;
-  if (total <= 0.5f) return;
-  for (float& v : h) v = std::min(v / total, 0.2f);
-  const float clamped = length(h);
-  for (int i = 0; i < 128; ++i) out[i] = static_cast<uint8_t>(static_cast<int>(h[i] / clamped * 255 + 0.5f));
 }
 
 // The largest difference from OpenCV's separable filter with replicated
@@ -180,51 +128,64 @@ TEST(OrientationTest, SplitBetweenTheNearestBinAndItsNeighbourOfAFastAngle) {
   }
 }
 
-// Noise, and steps, a checkerboard and diagonals whose differences are exactly
-// 0 or on the diagonal, so that every branch of the orientation is met. The
-// points take in half coordinates, negative ones, the last column and points
-// off the image (which leave the output as it was); both histogram loops
-// must give the same bytes.
-TEST(SiftPyramidTest, DescriptorsMatchThePlainTranscription) {
+// A ramp has the same gradient everywhere: along x it points at orientation
+// 0, along y at 2, falling along x at 4. Each of the 16 spatial bins gets
+// about a bin width of samples, a quarter of the length, which the clamp at
+// 0.2 and the second normalisation make 0.25 exactly: 64 in each spatial bin
+// of that orientation, 0 elsewhere.
+TEST(SiftPyramidTest, ARampGives64InEachSpatialBinOfItsOrientation) {
+  for (const auto& [dx, dy, bin] : {std::tuple{3, 0, 0}, {0, 3, 2}, {-3, 0, 4}}) {
+    std::vector<uint8_t> pixels(64 * 64);
+    for (int i = 0; i < 64 * 64; ++i) pixels[i] = static_cast<uint8_t>(96 + dx * (i % 64 - 32) + dy * (i / 64 - 32));
+    SiftPyramid pyramid(64, 64, 3);
+    pyramid.buildBase(64, 64, pixels.data());
+    pyramid.buildLevels();
+    for (float level : {0.0f, 1.0f}) {
+      uint8_t out[128];
+      float norm = 0.0f;
+      pyramid.computeDescriptor(32.0f, 32.0f, level, norm, out);
+      EXPECT_GT(norm, 0.5f);
+      for (int i = 0; i < 128; ++i) ASSERT_EQ(out[i], i % 8 == bin ? 64 : 0) << i << " level " << level;
+    }
+  }
+}
+
+// On noise, at points with half coordinates, negative ones, on the last
+// column and off the image, both histogram loops give the same bytes, and a
+// level is rounded to the nearest whole one. A point off the image leaves the
+// output as it was.
+TEST(SiftPyramidTest, DescriptorsAgreeAcrossHistogramLoopsAndRoundTheLevel) {
   const int width = 97;
   const int height = 83;
-  std::vector<std::vector<uint8_t>> images = {RandomPixels(width * height, 11),
-                                              std::vector<uint8_t>(width * height)};
-  for (int i = 0; i < width * height; ++i) {
-    const int x = i % width, y = i / width;
-    images[1][i] = static_cast<uint8_t>(x < 20 ? 10 : x < 40 ? 200 : x < 70 ? ((x / 6 + y / 6) % 2 ? 250 : 5)
-                                                                           : (x + y < 120 ? 0 : 128));
-  }
-  std::vector<std::pair<float, float>> points = {
-      {48.5f, 40.5f}, {10.5f, 20.0f}, {-0.5f, 10.0f}, {-1.5f, 30.0f}, {0.0f, 0.0f},   {96.0f, 40.0f},
-      {95.6f, 82.0f}, {1.0f, 1.0f},   {50.0f, 81.4f}, {-3.5f, -2.5f}, {200.0f, 40.0f}, {12.25f, 70.75f}};
+  const std::vector<uint8_t> pixels = RandomPixels(width * height, 11);
+  SiftPyramid pyramid(width, height, 3);
+  pyramid.buildBase(width, height, pixels.data());
+  pyramid.buildLevels();
+  std::vector<std::pair<float, float>> points = {{48.5f, 40.5f}, {-1.5f, 30.0f}, {96.0f, 40.0f}, {95.6f, 82.0f},
+                                                 {1.0f, 1.0f},   {-3.5f, -2.5f}, {12.25f, 70.75f}};
   std::mt19937 generator(13);
   std::uniform_real_distribution<float> coordinate(-20.0f, 110.0f);
-  for (int i = 0; i < 150; ++i) points.emplace_back(coordinate(generator), coordinate(generator));
-  for (const std::vector<uint8_t>& pixels : images) {
-    SiftPyramid pyramid(width, height, 3);
-    pyramid.buildBase(width, height, pixels.data());
-    pyramid.buildLevels();
-    for (int level = 0; level <= 5; ++level) {
-      for (const auto& [x, y] : points) {
-        uint8_t expected[128];
-        float expectedNorm = -1;
-        for (int i = 0; i < 128; ++i) expected[i] = static_cast<uint8_t>(255 - i);
-        ReferenceDescriptor(pyramid, x, y, level, expectedNorm, expected);
-        for (bool wide : {false, true}) {
-          SiftPyramid::setWideHistogramRows(wide);
-          uint8_t actual[128];
-          float actualNorm = -2;
-          for (int i = 0; i < 128; ++i) actual[i] = static_cast<uint8_t>(255 - i);
-          // The level is rounded to the nearest whole one.
-          pyramid.computeDescriptor(x, y, static_cast<float>(level) - (wide ? 0.0f : 0.4f), actualNorm, actual);
-          ASSERT_EQ(actualNorm, expectedNorm) << x << "," << y << " level " << level;
-          ASSERT_EQ(std::memcmp(actual, expected, 128), 0) << x << "," << y << " level " << level << " " << wide;
-        }
+  for (int i = 0; i < 100; ++i) points.emplace_back(coordinate(generator), coordinate(generator));
+  for (int level = 0; level <= 5; ++level) {
+    for (const auto& [x, y] : points) {
+      uint8_t bytes[2][128];
+      float norms[2] = {-1.0f, -2.0f};
+      for (int road = 0; road < 2; ++road) {
+        for (int i = 0; i < 128; ++i) bytes[road][i] = static_cast<uint8_t>(255 - i);
+        SiftPyramid::setWideHistogramRows(road == 0);
+        pyramid.computeDescriptor(x, y, static_cast<float>(level) - 0.4f * road, norms[road], bytes[road]);
       }
+      ASSERT_EQ(norms[0], norms[1]) << x << "," << y << " level " << level;
+      ASSERT_EQ(std::memcmp(bytes[0], bytes[1], 128), 0) << x << "," << y << " level " << level;
     }
   }
   SiftPyramid::setWideHistogramRows(true);
+  uint8_t out[128];
+  for (int i = 0; i < 128; ++i) out[i] = static_cast<uint8_t>(i);
+  float norm = -1.0f;
+  pyramid.computeDescriptor(200.0f, 40.0f, 1.0f, norm, out);
+  EXPECT_EQ(norm, 0.0f);
+  for (int i = 0; i < 128; ++i) EXPECT_EQ(out[i], i);
 }
 
 }  // namespace
