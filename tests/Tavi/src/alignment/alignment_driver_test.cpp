@@ -1,7 +1,7 @@
 #include <gtest/gtest.h>
 
-#include <fstream>
 #include <limits>
+#include <sstream>
 #include <stdexcept>
 #include <string>
 #include <thread>
@@ -43,9 +43,9 @@ class AlignmentDriverTest : public testing::Test {
   void TearDown() override { unloadSDMModel(); }
 
   Status Load(const SDMCore::SDMModel& model) {
-    std::ofstream file(dir_.path() + "/model.bin", std::ios::binary);
-    EXPECT_TRUE(SDMCore::writeSDMModel(file, model));
-    file.close();
+    std::ostringstream bytes;
+    SDMCore::writeSDMModel(bytes, model);
+    dir_.write("model.bin", bytes.str());
     return loadSDMModel(dir_.path(), "model.bin");
   }
 
@@ -56,10 +56,10 @@ class AlignmentDriverTest : public testing::Test {
 
 // Without a model, after a failed load (which drops the earlier model), and
 // with a model that would take alignment outside its arrays, alignment
-// reports the failed load and leaves no points.
-TEST_F(AlignmentDriverTest, AlignsOnlyWithASafeLoadedModel) {
-  EXPECT_EQ(unloadSDMModel(), STATUS_OK);
-  EXPECT_EQ(unloadSDMModel(), STATUS_OK);
+// reports the failed load and leaves no points. Rectangles that would divide
+// by zero or cast what no int holds, and an empty image, are refused; one
+// wholly outside the image or inverted meets the image library's range check.
+TEST_F(AlignmentDriverTest, RefusesUnsafeModelsAndUnusableInputs) {
   const Rectangle<float> rect{100, 60, 200, 170};
   std::vector<float> points(3);
   EXPECT_EQ(align68Points(image_, rect, points), STATUS_MODEL_LOAD_FAILED);
@@ -73,7 +73,6 @@ TEST_F(AlignmentDriverTest, AlignsOnlyWithASafeLoadedModel) {
   points.assign(10, 1.0f);
   EXPECT_EQ(align5Points(image_, rect, points), STATUS_MODEL_LOAD_FAILED);
   EXPECT_TRUE(points.empty());
-
   std::vector<SDMCore::SDMModel> unsafe(6, RandomModel(1));
   unsafe[0].scalesPerOctave = -2;
   unsafe[1].stageLevels = {6};
@@ -82,25 +81,18 @@ TEST_F(AlignmentDriverTest, AlignsOnlyWithASafeLoadedModel) {
   // Found by fuzzing: a point of the mean shape at 1e25 box sizes padded the
   // image by more than an int holds; a NaN in a map would do the same later.
   unsafe[4].meanShape[7] = 1e25f;
-  unsafe[5].stageMaps[0].projection.data()[1000] = std::numeric_limits<float>::quiet_NaN();
+  const float nan = std::numeric_limits<float>::quiet_NaN();
+  unsafe[5].stageMaps[0].projection.data()[1000] = nan;
   for (const SDMCore::SDMModel& model : unsafe) {
     EXPECT_EQ(Load(model), STATUS_MODEL_LOAD_FAILED);
     EXPECT_EQ(align68Points(image_, rect, points), STATUS_MODEL_LOAD_FAILED);
   }
-}
 
-// Rectangles that would divide by zero or cast what no int holds, and an
-// empty image, are refused; one wholly outside the image or inverted meets
-// the image library's range check.
-TEST_F(AlignmentDriverTest, UnusableRectanglesAndImagesAreRefused) {
   ASSERT_EQ(Load(RandomModel(0)), STATUS_OK);
-  const float nan = std::numeric_limits<float>::quiet_NaN();
   const float inf = std::numeric_limits<float>::infinity();
-  std::vector<float> points;
-  for (const Rectangle<float>& rect : {Rectangle<float>{nan, 50, 150, 150}, Rectangle<float>{50, 50, inf, 150},
-                                       Rectangle<float>{-1e30f, -1e30f, 1e30f, 1e30f},
-                                       Rectangle<float>{80, 80, 80, 150}}) {
-    EXPECT_THROW(align68Points(image_, rect, points), std::invalid_argument) << rect.left << " " << rect.right;
+  for (const Rectangle<float>& bad : {Rectangle<float>{nan, 50, 150, 150}, Rectangle<float>{50, 50, inf, 150},
+                                      Rectangle<float>{-1e30f, -1e30f, 1e30f, 1e30f}, Rectangle<float>{80, 80, 80, 150}}) {
+    EXPECT_THROW(align68Points(image_, bad, points), std::invalid_argument) << bad.left << " " << bad.right;
   }
   EXPECT_THROW(align68Points(Image{0, 0, 0, bytes_.data()}, {0, 0, 10, 10}, points), std::invalid_argument);
   EXPECT_THROW(align68Points(image_, {400, 400, 450, 450}, points), cv::Exception);

@@ -24,8 +24,7 @@ TEST(AlignmentFrameTest, CropScaleAndFaceBoxOfATableOfRectangles) {
     int columns, rows;  // of the region taken to the frame
     cv::Rect face;
   } cases[] = {
-      // No crop, and 250 by 250 stays as it is: box 60, 70, 129 (not 190 -
-      // 60), 129.
+      // No crop, not resized: box 60, 70, 129 (not 190 - 60), 129.
       {250, 250, {60.75f, 70.25f, 190.5f, 200}, 0, 0, 250, 250, {53, 89, 154, 167}},
       // 101 / 2 = 50 is not greater than a width of 50, nor 150 than 160.
       {101, 300, {20, 40, 70, 200}, 0, 0, 101, 300, {42, 52, 147, 172}},
@@ -37,8 +36,7 @@ TEST(AlignmentFrameTest, CropScaleAndFaceBoxOfATableOfRectangles) {
       {640, 480, {560, 380, 650, 470}, 515, 335, 124, 144, {80, 101, 217, 202}},
       // The crop offsets stay unrounded; the region's size is truncated.
       {640, 480, {200.5f, 150.5f, 330.75f, 290.75f}, 135.375f, 80.375f, 260, 280, {55, 80, 150, 162}},
-      // No width to take: the centred box, 0.4545 of the image before the
-      // resize.
+      // No width to take: the centred box, 0.4545 of the image before the resize.
       {300, 300, {inf, 0, inf, 300}, 0, 0, 300, 300, {75, 102, 163, 176}},
   };
   for (const auto& c : cases) {

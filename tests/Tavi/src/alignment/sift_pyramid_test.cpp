@@ -34,47 +34,46 @@ double DistanceFromOpenCv(const float* src, const float* dst, int width, int hei
   return cv::norm(expected, cv::Mat(height, width, CV_32F, const_cast<float*>(dst)), cv::NORM_INF);
 }
 
-TEST(GaussianKernelTest, IsTheNormalisedIntegratedGaussianWithTheRadiiForThreeScales) {
-  const std::vector<float> kernel = gaussianKernel(1.226f);
-  const int r = static_cast<int>(kernel.size() / 2);
-  const double t = 1.0 / (1.226 * std::sqrt(2.0));
-  for (int i = 0; i <= r; ++i) {
-    EXPECT_EQ(kernel[r - i], kernel[r + i]);
-    const double mass = 0.5 * (std::erf((i + 0.5) * t) - std::erf((i - 0.5) * t));
-    EXPECT_NEAR(kernel[r + i], mass / (1.0 - std::erfc((r + 0.5) * t)), 2e-7) << i;
+// The integrated Gaussian of sigma over each pixel, normalised to the mass
+// of the kernel's 2r + 1 pixels, r = truncate(3.5 sigma + 0.5).
+std::vector<float> IntegratedGaussian(double sigma) {
+  const int r = static_cast<int>(sigma * 3.5 + 0.5);
+  const double t = 1.0 / (sigma * std::sqrt(2.0));
+  std::vector<float> kernel;
+  for (int i = -r; i <= r; ++i) {
+    kernel.push_back(0.5 * (std::erf((i + 0.5) * t) - std::erf((i - 0.5) * t)) / (1.0 - std::erfc((r + 0.5) * t)));
   }
-  EXPECT_EQ(gaussianKernel(0.1f), std::vector<float>{1.0f});
-  // The base kernel, the five level kernels of S = 3, and the descriptor radii
-  // of levels 0 to 2.
-  EXPECT_EQ(gaussianKernel(std::sqrt(0.8f * 0.8f - 0.5f * 0.5f)).size(), 5u);
-  const SiftPyramid pyramid(20, 20, 3);
-  const float k = pyramid.sigmaRatio();
-  EXPECT_EQ(k, static_cast<float>(std::pow(2.0, 1.0 / 3)));
-  float sigma = std::sqrt(k * k - 1.0f) * 0.8f;
-  for (size_t expected : {5, 7, 7, 9, 11}) {
-    EXPECT_EQ(gaussianKernel(sigma).size(), expected) << sigma;
-    sigma *= k;
-  }
-  EXPECT_EQ(pyramid.radius(0), 9);
-  EXPECT_EQ(pyramid.radius(1), 11);
-  EXPECT_EQ(pyramid.radius(2), 14);
+  return kernel;
 }
 
-TEST(SiftPyramidTest, LevelsAreSuccessiveBlursOfTheScaledBase) {
+// Level 0 is the image over 255 blurred from 0.5 to 0.8, and level i level
+// i - 1 blurred by 0.8 sqrt(k^2 - 1) k^(i - 1), k = 2^(1/3).
+TEST(SiftPyramidTest, LevelsAreSuccessiveIntegratedGaussianBlursOfTheScaledBase) {
+  for (float sigma : {0.1f, 0.6244998f, 1.226f, 1.545f}) {
+    const std::vector<float> expected = IntegratedGaussian(sigma);
+    const std::vector<float> kernel = gaussianKernel(sigma);
+    ASSERT_EQ(kernel.size(), expected.size()) << sigma;
+    for (size_t i = 0; i < kernel.size(); ++i) EXPECT_NEAR(kernel[i], expected[i], 2e-7) << sigma;
+  }
   const std::vector<uint8_t> pixels = RandomPixels(40 * 30, 5);
   SiftPyramid pyramid(40, 30, 3);
   pyramid.buildBase(40, 30, pixels.data());
   pyramid.buildLevels();
   std::vector<float> scaled(pixels.begin(), pixels.end());
   for (float& v : scaled) v /= 255.0f;
-  EXPECT_LT(DistanceFromOpenCv(scaled.data(), pyramid.level(0).pixels, 40, 30,
-                               gaussianKernel(std::sqrt(0.8f * 0.8f - 0.25f))), 1e-6);
-  const float k = pyramid.sigmaRatio();
-  float sigma = std::sqrt(k * k - 1.0f) * 0.8f;
+  EXPECT_LT(DistanceFromOpenCv(scaled.data(), pyramid.level(0).pixels, 40, 30, IntegratedGaussian(std::sqrt(0.39))),
+            1e-6);
+  const double k = std::pow(2.0, 1.0 / 3);
+  EXPECT_EQ(pyramid.sigmaRatio(), static_cast<float>(k));
+  double sigma = std::sqrt(k * k - 1.0) * 0.8;
   for (size_t i = 1; i <= 5; ++i, sigma *= k) {
     EXPECT_LT(DistanceFromOpenCv(pyramid.level(i - 1).pixels, pyramid.level(i).pixels, 40, 30,
-                                 gaussianKernel(sigma)), 1e-6) << i;
+                                 IntegratedGaussian(sigma)), 1e-6) << i;
   }
+  // The descriptor's sampling radii of levels 0 to 2.
+  EXPECT_EQ(pyramid.radius(0), 9);
+  EXPECT_EQ(pyramid.radius(1), 11);
+  EXPECT_EQ(pyramid.radius(2), 14);
   // Building up to level 2 only gives the same levels 0 to 2.
   SiftPyramid some(40, 30, 3);
   some.buildBase(40, 30, pixels.data());
@@ -87,10 +86,9 @@ TEST(SiftPyramidTest, LevelsAreSuccessiveBlursOfTheScaledBase) {
   EXPECT_LT(DistanceFromOpenCv(scaled.data(), dst.data(), 3, 2, kernel), 1e-6);
 }
 
-// Just below two pi, bin 8 wraps to 0 and the neighbour is 7; exactly 0 on
-// the horizontal axis is all in bin 0; elsewhere the neighbour is on the
-// angle's side of the bin centre. The fast angle follows the quadrants and
-// stays within 0.0061 of atan2.
+// Just below two pi, bin 8 wraps to 0 and the neighbour is 7; elsewhere the
+// neighbour is on the angle's side of the bin centre. The fast angle is in
+// [0, 2 pi) and within 0.0061 of atan2.
 TEST(OrientationTest, SplitBetweenTheNearestBinAndItsNeighbourOfAFastAngle) {
   const float angle = std::nextafter(kTwoPi, 0.0f);
   const float p = angle * 8.0f / kTwoPi;
@@ -100,22 +98,13 @@ TEST(OrientationTest, SplitBetweenTheNearestBinAndItsNeighbourOfAFastAngle) {
   EXPECT_EQ(wrap.secondBin, 7);
   EXPECT_EQ(wrap.mainWeight, 1.0f - (8.0f - p));
   EXPECT_EQ(wrap.secondWeight, 8.0f - p);
-  const GradientCell axis = gradientCell(2.0f, 0.0f);
-  EXPECT_EQ(axis.magnitude, 2.0f);
-  EXPECT_EQ(axis.mainBin, 0);
-  EXPECT_EQ(axis.secondBin, 7);
-  EXPECT_EQ(axis.mainWeight, 1.0f);
   const GradientCell above = splitOrientation(3.25f * kTwoPi / 8, 1.0f);
   EXPECT_EQ(above.mainBin, 3);
   EXPECT_EQ(above.secondBin, 4);
   EXPECT_NEAR(above.secondWeight, 0.25f, 1e-5f);
 
   EXPECT_EQ(fastAngle(0.0f, 0.0f), 0.0f);
-  EXPECT_EQ(fastAngle(0.0f, 1.0f), kHalfPi);
   EXPECT_EQ(fastAngle(0.0f, -1.0f), -kHalfPi + kTwoPi);
-  EXPECT_EQ(fastAngle(-1.0f, 0.0f), kPi);
-  EXPECT_EQ(fastAngle(2.0f, 1.0f), 0.5f / (0.5f * 0.28f * 0.5f + 1.0f));
-  EXPECT_EQ(fastAngle(1.0f, 2.0f), kHalfPi - 2.0f / (2.0f * 2.0f + 0.28f));
   std::mt19937 generator(7);
   std::uniform_real_distribution<float> value(-1.0f, 1.0f);
   for (int i = 0; i < 2000; ++i) {
