@@ -23,9 +23,9 @@
 namespace training {
 namespace {
 
+// A face 80 wide, brows at 20 and chin at 140: the box is 120 on a side,
+// centred on x 50 and y 80.
 TEST(FaceBoxTest, SquareFromBrowTopToLowestPointCentredOnThePoints) {
-  // A face 80 wide, brows at 20 and chin at 140: the box is 120 on a side,
-  // centred on x 50 and y 80.
   std::vector<cv::Point2f> points(68, cv::Point2f(50.0f, 60.0f));
   points[0] = {10.0f, 70.0f};
   points[16] = {90.0f, 70.0f};
@@ -33,10 +33,7 @@ TEST(FaceBoxTest, SquareFromBrowTopToLowestPointCentredOnThePoints) {
   points[19] = {30.0f, 20.0f};
   points[30] = {50.0f, 5.0f};  // above the brows, but no brow: ignored for the top
   const cv::Rect2f box = faceBoxFromPoints(points);
-  EXPECT_FLOAT_EQ(box.width, 120.0f);
-  EXPECT_FLOAT_EQ(box.height, 120.0f);
-  EXPECT_FLOAT_EQ(box.x, -10.0f);
-  EXPECT_FLOAT_EQ(box.y, 20.0f);
+  EXPECT_EQ(box, cv::Rect2f(-10.0f, 20.0f, 120.0f, 120.0f));
   EXPECT_FLOAT_EQ(intersectionOverUnion(box, box), 1.0f);
   EXPECT_FLOAT_EQ(intersectionOverUnion(box, cv::Rect2f(-10, 20, 60, 120)), 0.5f);
 }
@@ -55,8 +52,7 @@ tavilib::CascadeStage FixedCalibration(int answer) {
   bias[answer] = 50.0f;
   const tavilib::DefaultCascadeTables tables;
   for (size_t i = 0; i < tables.offsetsX.size(); ++i) {
-    stage.offsetsScales.push_back(
-        {tables.offsetsX[i], tables.offsetsY[i], static_cast<float>(tables.scales[i])});
+    stage.offsetsScales.push_back({tables.offsetsX[i], tables.offsetsY[i], static_cast<float>(tables.scales[i])});
   }
   return stage;
 }
@@ -105,22 +101,6 @@ TEST(TrainingDataTest, RefusesMissingFoldersAndBadLinesNamingFileAndLine) {
   const std::string cut = dir.write("short.csv", header + "\nimages/a.jpg,a,1\n");
   EXPECT_EQ(DataErrorOf([&] { readLabelledFaces(cut); }), cut + ":2: 3 fields, the header has 138");
   EXPECT_NE(DataErrorOf([&] { readImage(dir.write("broken.jpg", "not an image")); }), "");
-}
-
-// The deploy net without its softmax at the training batch and size; in the
-// 48-pixel grader every convolution of a pooled copy of the input learns at
-// the input-scaled rate, the one behind a normalisation does not.
-TEST(NetTrainerTest, TrainingFormOfTheCascadeNets) {
-  const nn::NetParameter scan = trainingDescription(tavilib::kStage0NetText, 16, 12, true);
-  EXPECT_NE(scan.layers(scan.layers_size() - 1).type(), nn::LayerParameter::SOFTMAX);
-  EXPECT_EQ(scan.input_dim(0), 16);
-  EXPECT_EQ(scan.input_dim(2), 12);
-  const nn::NetParameter grader = trainingDescription(tavilib::kStage2NetText, 4, 48, false);
-  for (const nn::LayerParameter& layer : grader.layers()) {
-    if (layer.type() == nn::LayerParameter::CONVOLUTION) {
-      EXPECT_FLOAT_EQ(layer.blobs_lr(0), layer.name() != "x64-conv2" ? 1.0f / 4096.0f : 1.0f) << layer.name();
-    }
-  }
 }
 
 // Bright squares in the middle against noise: a problem the scan net must

@@ -2,10 +2,9 @@
 
 #include <opencv2/core.hpp>
 
-#include <cmath>
+#include <algorithm>
 #include <filesystem>
 #include <fstream>
-#include <random>
 #include <string>
 #include <vector>
 
@@ -21,48 +20,40 @@
 namespace landmarks {
 namespace {
 
-// Targets exactly bias + (x - 0.5) P: the fit gives P back, and its stage,
-// applied as the regression applies it, reproduces every target.
+// Targets exactly bias + (x - 0.5) P, as a stage moves a shape: the fit gives
+// P back, and its stage reproduces every target.
 TEST(FitStageTest, RecoversAnExactlyLinearMap) {
-  const size_t rows = 400, columns = 12, outputs = 3;
-  std::mt19937 random(5);
-  std::uniform_real_distribution<float> draw(0.0f, 1.0f);
-  std::vector<float> projection(columns * outputs), features(rows * columns), targets(rows * outputs);
-  for (float& p : projection) p = draw(random) - 0.5f;
-  for (float& f : features) f = draw(random);
-  const float bias[outputs] = {2.0f, -1.0f, 0.5f};
-  for (size_t r = 0; r < rows; ++r) {
-    for (size_t q = 0; q < outputs; ++q) {
-      targets[r * outputs + q] = bias[q];
-      for (size_t c = 0; c < columns; ++c) {
-        targets[r * outputs + q] += (features[r * columns + c] - 0.5f) * projection[c * outputs + q];
-      }
-    }
+  const int rows = 400, columns = 12, outputs = 3;
+  cv::RNG random(5);
+  std::vector<float> features(rows * columns), targets;
+  random.fill(cv::Mat(1, rows * columns, CV_32F, features.data()), cv::RNG::UNIFORM, 0.0f, 1.0f);
+  mp::pca_map truth;
+  truth.mean = mp::matrix(1, columns);
+  truth.mean.fill(0.5f);
+  truth.projection = mp::matrix(columns, outputs);
+  random.fill(cv::Mat(columns, outputs, CV_32F, truth.projection.data()), cv::RNG::UNIFORM, -0.5f, 0.5f);
+  mp::matrix bias(1, outputs);
+  std::copy_n(std::vector<float>{2.0f, -1.0f, 0.5f}.begin(), 3, bias.data());
+  for (int r = 0; r < rows; ++r) {
+    std::vector<float> target(outputs);
+    SDMCore::applyStage(features.data() + r * columns, truth, bias, target);
+    targets.insert(targets.end(), target.begin(), target.end());
   }
   mp::pca_map map;
   mp::matrix fittedBias;
   std::vector<float> centred = features;
   fitStage(centred, targets, rows, columns, outputs, 1e-9, &map, &fittedBias);
-  for (size_t i = 0; i < projection.size(); ++i) {
-    EXPECT_NEAR(map.projection.data()[i], projection[i], 1e-3) << i;
+  for (int i = 0; i < columns * outputs; ++i) {
+    EXPECT_NEAR(map.projection.data()[i], truth.projection.data()[i], 1e-3) << i;
   }
-  for (size_t r = 0; r < rows; r += 7) {
+  for (int r = 0; r < rows; r += 7) {
     std::vector<float> shape(outputs);
     SDMCore::applyStage(features.data() + r * columns, map, fittedBias, shape);
-    for (size_t q = 0; q < outputs; ++q) EXPECT_NEAR(shape[q], targets[r * outputs + q], 1e-3) << r;
+    for (int q = 0; q < outputs; ++q) EXPECT_NEAR(shape[q], targets[r * outputs + q], 1e-3) << r;
   }
 }
 
 const char kValidationCsv[] = TAVI_SOURCE_DIR "/../shared/data/faces68/val.csv";
-
-std::vector<float> Flat(const std::vector<cv::Point2f>& points) {
-  std::vector<float> flat;
-  for (const cv::Point2f& p : points) {
-    flat.push_back(p.x);
-    flat.push_back(p.y);
-  }
-  return flat;
-}
 
 // A few held-out faces, prepared from their face boxes.
 std::vector<LandmarkSample> RealSamples(size_t count) {
@@ -71,10 +62,10 @@ std::vector<LandmarkSample> RealSamples(size_t count) {
   for (const training::LabelledFace& face : training::readLabelledFaces(kValidationCsv)) {
     const cv::Mat image = training::readImage(std::filesystem::path(kValidationCsv).parent_path() / face.file);
     const cv::Rect2f box = training::faceBoxFromPoints(face.points);
+    std::vector<float> points;
+    for (const cv::Point2f& p : face.points) points.insert(points.end(), {p.x, p.y});
     LandmarkSample sample;
-    if (makeSample(image, {box.x, box.y, box.br().x, box.br().y}, Flat(face.points), 100, &sample)) {
-      samples.push_back(sample);
-    }
+    if (makeSample(image, {box.x, box.y, box.br().x, box.br().y}, points, 100, &sample)) samples.push_back(sample);
     if (samples.size() == count) break;
   }
   return samples;

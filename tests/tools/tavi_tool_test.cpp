@@ -29,18 +29,14 @@ ToolRun RunTool(const std::string& arguments) {
   FILE* pipe = popen(command.c_str(), "r");
   std::string output;
   char buffer[4096];
-  for (size_t got; (got = fread(buffer, 1, sizeof buffer, pipe)) > 0;) {
-    output.append(buffer, got);
-  }
+  for (size_t got; (got = fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, got);
   return {WEXITSTATUS(pclose(pipe)), output};
 }
 
 std::vector<nlohmann::json> JsonLines(const std::string& output) {
   std::vector<nlohmann::json> lines;
   std::istringstream stream(output);
-  for (std::string line; std::getline(stream, line);) {
-    lines.push_back(nlohmann::json::parse(line));
-  }
+  for (std::string line; std::getline(stream, line);) lines.push_back(nlohmann::json::parse(line));
   return lines;
 }
 
@@ -100,8 +96,7 @@ TEST(TaviToolTest, ReportsEveryFileOfAMixedFolderInOrderAndDrawsWhole) {
   const ToolRun csv = RunTool("detect --csv --landmarks 5 '" + input + "/a,\"colour\".png'");
   EXPECT_EQ(csv.status, 0);
   EXPECT_EQ(csv.output.find("file,width,height,min_face,face,left,top,right,bottom,score,x0,y0,"), 0u);
-  EXPECT_NE(csv.output.find("\n\"" + input + "/a,\"\"colour\"\".png\",512,512,40,0,"),
-            std::string::npos);
+  EXPECT_NE(csv.output.find("\n\"" + input + "/a,\"\"colour\"\".png\",512,512,40,0,"), std::string::npos);
 }
 
 TEST(TaviToolTest, RefusesBadOptionsAndBrokenModelsBeforeAnyImage) {

@@ -27,8 +27,7 @@ std::string ReadFile(const std::string& path) {
   return contents.str();
 }
 
-// The tool's exit status (-1 if it did not exit normally); its stderr goes to
-// *errors.
+// The tool's exit status (-1 if it did not exit normally); its stderr goes to *errors.
 int RunTool(const std::string& tool, const std::vector<std::string>& args, const TempDir& dir,
             std::string* errors) {
   std::string command = tool;
@@ -86,9 +85,7 @@ TEST(UpgradeNetProtoTest, ToolsRefuseWrongArgumentsAndUnusableFiles) {
   } cases[] = {
       {kTextTool, {}, "Usage: upgrade_net_proto_text.bin INPUT OUTPUT"},
       {kBinaryTool, {text, out, out}, "Usage: upgrade_net_proto_binary.bin INPUT OUTPUT"},
-      // A folder would read as an empty net.
-      {kTextTool, {dir.path(), out},
-       "upgrade_net_proto_text.bin: cannot read " + dir.path() + "\n"},
+      {kTextTool, {dir.path(), out}, "cannot read " + dir.path() + "\n"},  // not an empty net
       {kTextTool, {binary, out}, binary + " is not a network text description"},
       {kBinaryTool, {text, out}, text + " is not a network binary weight file"},
       {kTextTool, {text, unwritable}, "cannot write " + unwritable},
