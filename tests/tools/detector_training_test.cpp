@@ -84,10 +84,13 @@ std::string DataErrorOf(const std::function<void()>& action) {
   return "";
 }
 
-TEST(TrainingDataTest, RefusesMissingFoldersAndBadLinesNamingFileAndLine) {
+// A missing folder, an image that does not decode, a field that is no number
+// and a line short of fields are refused, naming the file (and the line).
+TEST(TrainingDataTest, RefusesMissingFilesAndBadLinesNamingFileAndLine) {
   TempDir dir;
-  EXPECT_EQ(DataErrorOf([&] { loadTrainingData(dir.path() + "/"); }),
-            "cannot open " + dir.path() + "/faces68/train.csv");
+  EXPECT_NE(DataErrorOf([&] { loadTrainingData(dir.path() + "/"); }).find("/faces68/train.csv"), std::string::npos);
+  const std::string broken = dir.write("broken.jpg", "not an image");
+  EXPECT_NE(DataErrorOf([&] { readImage(broken); }).find(broken), std::string::npos);
   std::string header = "file,person";
   std::string line = "images/a.jpg,a";
   for (int p = 0; p < 68; ++p) {
@@ -97,10 +100,9 @@ TEST(TrainingDataTest, RefusesMissingFoldersAndBadLinesNamingFileAndLine) {
   const std::string good = header + "\n" + line + "\n";
   EXPECT_EQ(readLabelledFaces(dir.write("good.csv", good)).at(0).points.at(67), cv::Point2f(1, 2));
   const std::string bad = dir.write("bad.csv", good + line.substr(0, line.size() - 1) + "x\n");
-  EXPECT_EQ(DataErrorOf([&] { readLabelledFaces(bad); }), bad + ":3: 'x' is not a number");
+  EXPECT_EQ(DataErrorOf([&] { readLabelledFaces(bad); }).find(bad + ":3:"), 0u);
   const std::string cut = dir.write("short.csv", header + "\nimages/a.jpg,a,1\n");
-  EXPECT_EQ(DataErrorOf([&] { readLabelledFaces(cut); }), cut + ":2: 3 fields, the header has 138");
-  EXPECT_NE(DataErrorOf([&] { readImage(dir.write("broken.jpg", "not an image")); }), "");
+  EXPECT_EQ(DataErrorOf([&] { readLabelledFaces(cut); }).find(cut + ":2:"), 0u);
 }
 
 // Bright squares in the middle against noise: a problem the scan net must

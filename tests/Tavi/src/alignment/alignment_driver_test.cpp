@@ -90,8 +90,9 @@ TEST_F(AlignmentDriverTest, RefusesUnsafeModelsAndUnusableInputs) {
 
   ASSERT_EQ(Load(RandomModel(0)), STATUS_OK);
   const float inf = std::numeric_limits<float>::infinity();
-  for (const Rectangle<float>& bad : {Rectangle<float>{nan, 50, 150, 150}, Rectangle<float>{50, 50, inf, 150},
-                                      Rectangle<float>{-1e30f, -1e30f, 1e30f, 1e30f}, Rectangle<float>{80, 80, 80, 150}}) {
+  using Rect = Rectangle<float>;
+  for (const Rect& bad : {Rect{nan, 50, 150, 150}, Rect{50, 50, inf, 150}, Rect{-1e30f, -1e30f, 1e30f, 1e30f},
+                          Rect{80, 80, 80, 150}}) {
     EXPECT_THROW(align68Points(image_, bad, points), std::invalid_argument) << bad.left << " " << bad.right;
   }
   EXPECT_THROW(align68Points(Image{0, 0, 0, bytes_.data()}, {0, 0, 10, 10}, points), std::invalid_argument);
