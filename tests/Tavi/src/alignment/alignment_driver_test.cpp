@@ -84,7 +84,7 @@ TEST_F(AlignmentDriverTest, RefusesUnsafeModelsAndUnusableInputs) {
   const float nan = std::numeric_limits<float>::quiet_NaN();
   unsafe[5].stageMaps[0].projection.data()[1000] = nan;
   for (const SDMCore::SDMModel& model : unsafe) {
-    EXPECT_EQ(Load(model), STATUS_MODEL_LOAD_FAILED);
+    ASSERT_EQ(Load(model), STATUS_MODEL_LOAD_FAILED);  // aligning with it would crash
     EXPECT_EQ(align68Points(image_, rect, points), STATUS_MODEL_LOAD_FAILED);
   }
 
