@@ -29,20 +29,4 @@ TEST(GenerateCascadeMeansTest, TheCommittedTablesAreTheToolsOutput) {
       << "regenerate the tables with the tool instead of editing them";
 }
 
-// A mean file one value short, or whose last number has no white space after
-// it (and so is not read), is refused; so is a missing argument.
-TEST(GenerateCascadeMeansTest, RefusesIncompleteFoldersAndBadArguments) {
-  for (const auto& [stage2Count, ending] : {std::pair<int, const char*>{6912, ""}, {6911, "\n"}}) {
-    TempDir dir;
-    for (const auto& [folder, count] : {std::pair<const char*, int>{"x32Net-x32-3Scales-200", 1728},
-                                        {"x16Net-demo", 432}, {"x32Net", 1728}, {"x64Net", stage2Count}}) {
-      std::string values = "128";
-      for (int i = 1; i < count; ++i) values += " 128";
-      dir.write(std::string("cascades/") + folder + "/mean", values + ending);
-    }
-    EXPECT_EQ(RunGenerator(dir.path() + " " + dir.path() + "/out.cpp note"), 1) << stage2Count;
-    EXPECT_EQ(RunGenerator(dir.path()), 2);
-  }
-}
-
 }  // namespace

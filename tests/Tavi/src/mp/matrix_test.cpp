@@ -4,8 +4,6 @@
 
 #include <cstdint>
 #include <cstring>
-#include <limits>
-#include <new>
 #include <sstream>
 #include <string>
 
@@ -50,9 +48,8 @@ TEST(MatrixTest, RecordsWriteReadAndSkipAlsoWithoutElements) {
 
 // The limit is compared with four times the count plus eight (a record of
 // one float passes 12, not 11), and 0 switches it off; a refused record
-// leaves the matrix as it was. -1 by -1 has a product of 1: one float is
-// read, and no more. A byte count that overflows asks for the largest size.
-TEST(MatrixTest, ReadLimitNegativeDimensionsAndHugeRecords) {
+// leaves the matrix as it was.
+TEST(MatrixTest, ReadLimitIsFourTimesTheCountPlusEight) {
   const std::string one = Int64Bytes(1) + Int64Bytes(1) + FloatBytes(0.5f);
   for (size_t limit : {size_t{11}, size_t{12}, size_t{0}}) {
     std::istringstream stream(one);
@@ -60,15 +57,6 @@ TEST(MatrixTest, ReadLimitNegativeDimensionsAndHugeRecords) {
     EXPECT_EQ(m.read(stream, limit), limit != 11) << limit;
     EXPECT_EQ(m.data()[0], limit != 11 ? 0.5f : -3.0f) << limit;
   }
-  std::istringstream negative(Int64Bytes(-1) + Int64Bytes(-1) + FloatBytes(0.5f) + FloatBytes(99.0f));
-  matrix back;
-  EXPECT_TRUE(back.read(negative, 0));
-  EXPECT_EQ(back.rows(), -1);
-  ASSERT_TRUE(back.is_valid());
-  EXPECT_EQ(back.data()[0], 0.5f);
-  EXPECT_EQ(negative.tellg(), 20);
-  std::istringstream huge(Int64Bytes(std::numeric_limits<int64_t>::max()) + Int64Bytes(8));
-  EXPECT_THROW(back.read(huge, 0), std::bad_alloc);
 }
 
 TEST(MatrixTest, FillSetsEveryElement) {
