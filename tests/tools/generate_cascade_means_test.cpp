@@ -27,6 +27,7 @@ TEST(GenerateCascadeMeansTest, TheCommittedTablesAreTheToolsOutput) {
   ASSERT_EQ(RunGenerator(TAVI_SOURCE_DIR "/Tavi/public/ " + output + " " + note), 0);
   EXPECT_EQ(ReadFile(output), ReadFile(TAVI_SOURCE_DIR "/Tavi/src/detector/default_cascade_means.cpp"))
       << "regenerate the tables with the tool instead of editing them";
+  EXPECT_EQ(RunGenerator(dir.path()), 2);  // an argument missing
 }
 
 }  // namespace
