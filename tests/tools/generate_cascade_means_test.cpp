@@ -9,27 +9,9 @@
 
 namespace {
 
-// The built-in mean tables come from the shipped model folder.
-const char kShippedNote[] = "Tavi/public/cascades, trained by tools/train_detector --seed 1";
-
-void WriteMeanFolder(const TempDir& dir, int stage2Count, const std::string& ending) {
-  const std::pair<const char*, int> folders[] = {{"x32Net-x32-3Scales-200", 1728},
-                                                 {"x16Net-demo", 432},
-                                                 {"x32Net", 1728},
-                                                 {"x64Net", stage2Count}};
-  for (const auto& folder : folders) {
-    std::string values;
-    for (int i = 0; i < folder.second; ++i) {
-      values += i ? " 128" : "128";
-    }
-    dir.write(std::string("cascades/") + folder.first + "/mean", values + ending);
-  }
-}
-
 std::string ReadFile(const std::string& path) {
-  std::ifstream file(path);
   std::stringstream contents;
-  contents << file.rdbuf();
+  contents << std::ifstream(path).rdbuf();
   return contents.str();
 }
 
@@ -41,21 +23,11 @@ int RunGenerator(const std::string& arguments) {
 TEST(GenerateCascadeMeansTest, TheCommittedTablesAreTheToolsOutput) {
   TempDir dir;
   const std::string output = dir.path() + "/means.cpp";
-  ASSERT_EQ(RunGenerator(std::string(TAVI_SOURCE_DIR) + "/Tavi/public/ " + output + " '" +
-                         kShippedNote + "'"),
-            0);
+  const std::string note = "'Tavi/public/cascades, trained by tools/train_detector --seed 1'";
+  ASSERT_EQ(RunGenerator(TAVI_SOURCE_DIR "/Tavi/public/ " + output + " " + note), 0);
   EXPECT_EQ(ReadFile(output), ReadFile(TAVI_SOURCE_DIR "/Tavi/src/detector/default_cascade_means.cpp"))
       << "regenerate the tables with the tool instead of editing them";
-}
-
-TEST(GenerateCascadeMeansTest, RefusesIncompleteFoldersAndBadArguments) {
-  TempDir dir;
-  // Without white space after it, a file's last number is not read.
-  WriteMeanFolder(dir, 6912, "");
-  EXPECT_EQ(RunGenerator(dir.path() + " " + dir.path() + "/out.cpp note"), 1);
-  WriteMeanFolder(dir, 6911, "\n");
-  EXPECT_EQ(RunGenerator(dir.path() + " " + dir.path() + "/out.cpp note"), 1);
-  EXPECT_EQ(RunGenerator(dir.path()), 2);
+  EXPECT_EQ(RunGenerator(dir.path()), 2);  // an argument missing
 }
 
 }  // namespace

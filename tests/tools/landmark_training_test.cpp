@@ -2,87 +2,70 @@
 
 #include <opencv2/core.hpp>
 
-#include <cmath>
+#include <algorithm>
 #include <filesystem>
 #include <fstream>
-#include <random>
 #include <string>
 #include <vector>
 
-#include "alignment/alignment_frame.h"
+#include "alignment/sdm_model.h"
 #include "alignment/sdm_regression.h"
 #include "detector_training/face_box.h"
 #include "detector_training/training_data.h"
 #include "landmark_training/landmark_sample.h"
 #include "landmark_training/sdm_training.h"
+#include "tavilib.h"
 #include "temp_dir.h"
 
 namespace landmarks {
 namespace {
 
+// Targets exactly bias + (x - 0.5) P, as a stage moves a shape: the fit gives
+// P back, and its stage reproduces every target.
 TEST(FitStageTest, RecoversAnExactlyLinearMap) {
-  const size_t rows = 400;
-  const size_t columns = 12;
-  const size_t outputs = 3;
-  std::mt19937 random(5);
-  std::uniform_real_distribution<float> draw(0.0f, 1.0f);
-  std::vector<float> projection(columns * outputs);
-  for (float& p : projection) p = draw(random) - 0.5f;
-  const float bias[outputs] = {2.0f, -1.0f, 0.5f};
-  std::vector<float> features(rows * columns);
-  for (float& f : features) f = draw(random);
-  std::vector<float> targets(rows * outputs);
-  for (size_t r = 0; r < rows; ++r) {
-    for (size_t q = 0; q < outputs; ++q) {
-      // The map applies to centred features: the targets' mean is the bias
-      // only if the features' mean is taken out, which fitStage does.
-      float sum = bias[q];
-      for (size_t c = 0; c < columns; ++c) {
-        sum += (features[r * columns + c] - 0.5f) * projection[c * outputs + q];
-      }
-      targets[r * outputs + q] = sum;
-    }
+  const int rows = 400, columns = 12, outputs = 3;
+  cv::RNG random(5);
+  std::vector<float> features(rows * columns), targets;
+  random.fill(cv::Mat(1, rows * columns, CV_32F, features.data()), cv::RNG::UNIFORM, 0.0f, 1.0f);
+  mp::pca_map truth;
+  truth.mean = mp::matrix(1, columns);
+  truth.mean.fill(0.5f);
+  truth.projection = mp::matrix(columns, outputs);
+  random.fill(cv::Mat(columns, outputs, CV_32F, truth.projection.data()), cv::RNG::UNIFORM, -0.5f, 0.5f);
+  mp::matrix bias(1, outputs);
+  std::copy_n(std::vector<float>{2.0f, -1.0f, 0.5f}.begin(), 3, bias.data());
+  for (int r = 0; r < rows; ++r) {
+    std::vector<float> target(outputs);
+    SDMCore::applyStage(features.data() + r * columns, truth, bias, target);
+    targets.insert(targets.end(), target.begin(), target.end());
   }
   mp::pca_map map;
   mp::matrix fittedBias;
-  fitStage(features, targets, rows, columns, outputs, 1e-9, &map, &fittedBias);
-  for (size_t i = 0; i < projection.size(); ++i) {
-    EXPECT_NEAR(map.projection.data()[i], projection[i], 1e-3) << i;
+  std::vector<float> centred = features;
+  fitStage(centred, targets, rows, columns, outputs, 1e-9, &map, &fittedBias);
+  for (int i = 0; i < columns * outputs; ++i) {
+    EXPECT_NEAR(map.projection.data()[i], truth.projection.data()[i], 1e-3) << i;
   }
-  // bias + (x - mean) P reproduces every target.
-  for (size_t q = 0; q < outputs; ++q) {
-    float meanPart = 0.0f;
-    for (size_t c = 0; c < columns; ++c) {
-      meanPart += (map.mean.data()[c] - 0.5f) * projection[c * outputs + q];
-    }
-    EXPECT_NEAR(fittedBias.data()[q], bias[q] + meanPart, 1e-3) << q;
+  for (int r = 0; r < rows; r += 7) {
+    std::vector<float> shape(outputs);
+    SDMCore::applyStage(features.data() + r * columns, map, fittedBias, shape);
+    for (int q = 0; q < outputs; ++q) EXPECT_NEAR(shape[q], targets[r * outputs + q], 1e-3) << r;
   }
 }
 
 const char kValidationCsv[] = TAVI_SOURCE_DIR "/../shared/data/faces68/val.csv";
 
-std::vector<float> Flat(const std::vector<cv::Point2f>& points) {
-  std::vector<float> flat;
-  for (const cv::Point2f& p : points) {
-    flat.push_back(p.x);
-    flat.push_back(p.y);
-  }
-  return flat;
-}
-
 // A few held-out faces, prepared from their face boxes.
 std::vector<LandmarkSample> RealSamples(size_t count) {
   std::vector<LandmarkSample> samples;
-  if (!std::filesystem::exists(kValidationCsv)) {
-    return samples;
-  }
+  if (!std::filesystem::exists(kValidationCsv)) return samples;
   for (const training::LabelledFace& face : training::readLabelledFaces(kValidationCsv)) {
     const cv::Mat image = training::readImage(std::filesystem::path(kValidationCsv).parent_path() / face.file);
     const cv::Rect2f box = training::faceBoxFromPoints(face.points);
+    std::vector<float> points;
+    for (const cv::Point2f& p : face.points) points.insert(points.end(), {p.x, p.y});
     LandmarkSample sample;
-    if (makeSample(image, {box.x, box.y, box.br().x, box.br().y}, Flat(face.points), 100, &sample)) {
-      samples.push_back(sample);
-    }
+    if (makeSample(image, {box.x, box.y, box.br().x, box.br().y}, points, 100, &sample)) samples.push_back(sample);
     if (samples.size() == count) break;
   }
   return samples;
@@ -90,9 +73,7 @@ std::vector<LandmarkSample> RealSamples(size_t count) {
 
 TEST(TrainSdmTest, FeaturesAreTheRegressionsOwnAndAStageMovesShapesToTheTruth) {
   const std::vector<LandmarkSample> samples = RealSamples(20);
-  if (samples.empty()) {
-    GTEST_SKIP() << "no validation data at " << kValidationCsv;
-  }
+  if (samples.empty()) GTEST_SKIP() << "no validation data at " << kValidationCsv;
   SdmSettings settings;
   settings.stageLevels = {2};
   settings.ridge = 1e-2;
@@ -102,16 +83,16 @@ TEST(TrainSdmTest, FeaturesAreTheRegressionsOwnAndAStageMovesShapesToTheTruth) {
   ASSERT_EQ(model.stageMaps.size(), 1u);
   ASSERT_EQ(model.stageMaps[0].projection.rows(), 68 * 128);
 
-  // The model, written and read back, moves the starts of a face it learnt
-  // towards the truth.
+  // The model it writes loads as alignment loads it, and moves a start of a
+  // face it learnt towards the truth.
   TempDir dir;
-  const std::string path = dir.path() + "/model.sdm";
   {
-    std::ofstream file(path, std::ios::binary);
+    std::ofstream file(dir.path() + "/model.sdm", std::ios::binary);
     ASSERT_TRUE(SDMCore::writeSDMModel(file, model));
   }
-  SDMCore::SDMModel loaded;
-  ASSERT_TRUE(SDMCore::readSDMModel(path, loaded));
+  ASSERT_EQ(tavilib::loadSDMModel(dir.path(), "model.sdm"), tavilib::STATUS_OK);
+  const SDMCore::SDMModel loaded = *SDMCore::sdmModel;
+  tavilib::unloadSDMModel();
   const LandmarkSample& face = samples[3];
   const std::vector<std::vector<float>> starts = SDMCore::startShapes(loaded.meanShape, face.faceRect);
   const double before = normalisedError(starts[1], face.truth);

@@ -7,7 +7,6 @@
 #include <cstdio>
 #include <cstdlib>
 #include <filesystem>
-#include <fstream>
 #include <sstream>
 #include <string>
 #include <vector>
@@ -30,46 +29,39 @@ ToolRun RunTool(const std::string& arguments) {
   FILE* pipe = popen(command.c_str(), "r");
   std::string output;
   char buffer[4096];
-  for (size_t got; (got = fread(buffer, 1, sizeof buffer, pipe)) > 0;) {
-    output.append(buffer, got);
-  }
+  for (size_t got; (got = fread(buffer, 1, sizeof buffer, pipe)) > 0;) output.append(buffer, got);
   return {WEXITSTATUS(pclose(pipe)), output};
 }
 
 std::vector<nlohmann::json> JsonLines(const std::string& output) {
   std::vector<nlohmann::json> lines;
   std::istringstream stream(output);
-  for (std::string line; std::getline(stream, line);) {
-    lines.push_back(nlohmann::json::parse(line));
-  }
+  for (std::string line; std::getline(stream, line);) lines.push_back(nlohmann::json::parse(line));
   return lines;
 }
 
 // A folder of the sample in several forms, with files that are no images.
-void WriteMixedFolder(const std::string& folder) {
+void WriteMixedFolder(const TempDir& dir) {
   const cv::Mat colour = cv::imread(kSample, cv::IMREAD_COLOR);
-  cv::Mat grey;
-  cv::Mat alpha;
+  cv::Mat grey, alpha;
   cv::cvtColor(colour, grey, cv::COLOR_BGR2GRAY);
   cv::cvtColor(colour, alpha, cv::COLOR_BGR2BGRA);
-  fs::create_directories(folder + "/inner");
-  cv::imwrite(folder + "/a,\"colour\".png", colour);
-  cv::imwrite(folder + "/b-grey.png", grey);
-  cv::imwrite(folder + "/inner/c-alpha.png", alpha);
   std::vector<uchar> jpeg;
   cv::imencode(".jpg", colour, jpeg);
-  std::ofstream(folder + "/d-photo.jpg", std::ios::binary)
-      .write(reinterpret_cast<const char*>(jpeg.data()), static_cast<std::streamsize>(jpeg.size()));
-  std::ofstream(folder + "/e-cut.jpg", std::ios::binary)
-      .write(reinterpret_cast<const char*>(jpeg.data()), 600);
-  std::ofstream(folder + "/f-notes.txt") << "not a photo\n";
+  dir.write("in/d-photo.jpg", std::string(jpeg.begin(), jpeg.end()));
+  dir.write("in/e-cut.jpg", std::string(jpeg.begin(), jpeg.begin() + 600));
+  dir.write("in/f-notes.txt", "not a photo\n");
+  fs::create_directories(dir.path() + "/in/inner");
+  cv::imwrite(dir.path() + "/in/a,\"colour\".png", colour);
+  cv::imwrite(dir.path() + "/in/b-grey.png", grey);
+  cv::imwrite(dir.path() + "/in/inner/c-alpha.png", alpha);
 }
 
 TEST(TaviToolTest, ReportsEveryFileOfAMixedFolderInOrderAndDrawsWhole) {
   TempDir dir;
   const std::string input = dir.path() + "/in";
   const std::string drawn = dir.path() + "/drawn";
-  WriteMixedFolder(input);
+  WriteMixedFolder(dir);
   const ToolRun run = RunTool("detect --landmarks 68 --threads 2 --draw " + drawn + " " + input +
                           " " + dir.path() + "/absent.png");
   EXPECT_EQ(run.status, 1);
@@ -90,8 +82,7 @@ TEST(TaviToolTest, ReportsEveryFileOfAMixedFolderInOrderAndDrawsWhole) {
     EXPECT_NEAR(box[3], 170, 20) << names[i];
     EXPECT_TRUE(fs::exists(drawn + "/" + names[i])) << names[i];
   }
-  EXPECT_EQ(lines[3]["error"], "not an image OpenCV can decode");
-  EXPECT_EQ(lines[4]["error"], "not an image OpenCV can decode");
+  for (size_t i : {3, 4}) EXPECT_EQ(lines[i]["error"], "not an image OpenCV can decode") << names[i];
   EXPECT_EQ(lines[6]["error"], "no such file");
   for (const auto& entry : fs::recursive_directory_iterator(drawn)) {
     EXPECT_EQ(entry.path().string().find(".partial"), std::string::npos) << entry.path();
@@ -105,8 +96,7 @@ TEST(TaviToolTest, ReportsEveryFileOfAMixedFolderInOrderAndDrawsWhole) {
   const ToolRun csv = RunTool("detect --csv --landmarks 5 '" + input + "/a,\"colour\".png'");
   EXPECT_EQ(csv.status, 0);
   EXPECT_EQ(csv.output.find("file,width,height,min_face,face,left,top,right,bottom,score,x0,y0,"), 0u);
-  EXPECT_NE(csv.output.find("\n\"" + input + "/a,\"\"colour\"\".png\",512,512,40,0,"),
-            std::string::npos);
+  EXPECT_NE(csv.output.find("\n\"" + input + "/a,\"\"colour\"\".png\",512,512,40,0,"), std::string::npos);
 }
 
 TEST(TaviToolTest, RefusesBadOptionsAndBrokenModelsBeforeAnyImage) {

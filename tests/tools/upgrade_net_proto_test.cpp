@@ -27,14 +27,11 @@ std::string ReadFile(const std::string& path) {
   return contents.str();
 }
 
-// The tool's exit status (-1 if it did not exit normally); its stderr goes to
-// *errors.
+// The tool's exit status (-1 if it did not exit normally); its stderr goes to *errors.
 int RunTool(const std::string& tool, const std::vector<std::string>& args, const TempDir& dir,
             std::string* errors) {
   std::string command = tool;
-  for (const std::string& arg : args) {
-    command += " '" + arg + "'";
-  }
+  for (const std::string& arg : args) command += " '" + arg + "'";
   const int status = std::system((command + " >/dev/null 2>'" + dir.path() + "/stderr'").c_str());
   *errors = ReadFile(dir.path() + "/stderr");
   return WIFEXITED(status) ? WEXITSTATUS(status) : -1;
@@ -59,9 +56,7 @@ TEST(UpgradeNetProtoTest, ToolsUpgradeOldFilesAndKeepCurrentOnes) {
     SCOPED_TRACE(tool);
     TempDir dir;
     std::string old_file = v0.SerializeAsString();
-    if (!binary) {
-      google::protobuf::TextFormat::PrintToString(v0, &old_file);
-    }
+    if (!binary) google::protobuf::TextFormat::PrintToString(v0, &old_file);
     const std::string upgraded = dir.path() + "/upgraded";
     std::string errors;
     EXPECT_EQ(RunTool(tool, {dir.write("old", old_file), upgraded}, dir, &errors), 0);
@@ -90,9 +85,7 @@ TEST(UpgradeNetProtoTest, ToolsRefuseWrongArgumentsAndUnusableFiles) {
   } cases[] = {
       {kTextTool, {}, "Usage: upgrade_net_proto_text.bin INPUT OUTPUT"},
       {kBinaryTool, {text, out, out}, "Usage: upgrade_net_proto_binary.bin INPUT OUTPUT"},
-      // A folder would read as an empty net.
-      {kTextTool, {dir.path(), out},
-       "upgrade_net_proto_text.bin: cannot read " + dir.path() + "\n"},
+      {kTextTool, {dir.path(), out}, "cannot read " + dir.path() + "\n"},  // not an empty net
       {kTextTool, {binary, out}, binary + " is not a network text description"},
       {kBinaryTool, {text, out}, text + " is not a network binary weight file"},
       {kTextTool, {text, unwritable}, "cannot write " + unwritable},

@@ -11,7 +11,6 @@
 #include <opencv2/imgcodecs.hpp>
 
 #include "alignment/alignment_frame.h"
-
 #include "alignment/sdm_model.h"
 
 namespace SDMCore {
@@ -39,6 +38,9 @@ mp::matrix Row(const std::vector<float>& values) {
 
 cv::Mat Flat(int rows, int cols) { return cv::Mat(rows, cols, CV_8UC1, cv::Scalar(120)); }
 
+// Start 0 is the mean placed in the box; then the mean moved by a tenth of
+// the box to (a, b), a the outer loop: point 0 (0.3, 0.4) of a 100 by 80 box
+// at (10, 20) lands at (40 + 10a, 52 + 8b).
 TEST(StartShapesTest, MeanFirstThenEightMovesColumnMajor) {
   EXPECT_EQ(placeShape({0.0f, 0.0f, 1.0f, 1.0f, 0.5f, 0.25f}, cv::Rect(10, 20, 100, 40)),
             (std::vector<float>{10.0f, 20.0f, 110.0f, 60.0f, 60.0f, 30.0f}));
@@ -48,10 +50,8 @@ TEST(StartShapesTest, MeanFirstThenEightMovesColumnMajor) {
   EXPECT_EQ(starts[0], placeShape(kMean, box));
   const int moves[8][2] = {{-1, -1}, {-1, 0}, {-1, 1}, {0, -1}, {0, 1}, {1, -1}, {1, 0}, {1, 1}};
   for (int s = 1; s < 9; ++s) {
-    for (size_t p = 0; p < kMean.size(); p += 2) {
-      EXPECT_EQ(starts[s][p], 100.0f * ((kMean[p] - 0.5f) * 1.0f + 0.5f + moves[s - 1][0] * 0.1f) + 10.0f);
-      EXPECT_EQ(starts[s][p + 1], 80.0f * ((kMean[p + 1] - 0.5f) * 1.0f + 0.5f + moves[s - 1][1] * 0.1f) + 20.0f);
-    }
+    EXPECT_NEAR(starts[s][0], 40.0f + 10.0f * moves[s - 1][0], 1e-4f) << s;
+    EXPECT_NEAR(starts[s][1], 52.0f + 8.0f * moves[s - 1][1], 1e-4f) << s;
   }
 }
 
@@ -75,45 +75,54 @@ TEST(CoordinateMedianTest, TakesEachCoordinateApartAtPositionHalfN) {
   EXPECT_EQ(coordinateMedian({{0, 10}, {1, 0}, {2, 5}}), (std::vector<float>{1, 5}));
 }
 
+// f - mean = (1, -2, 0.5); delta = (1 - 4 + 0, 0.5 + 2 + 2) = (-3, 4.5); a
+// bias of another size than the shape is skipped.
 TEST(ApplyStageTest, AddsBiasPlusProjectedDifference) {
   mp::pca_map map;
   map.mean = Row({1.0f, 2.0f, 3.0f});
   map.projection = mp::matrix(3, 2);
   const float projection[] = {1.0f, 0.5f, 2.0f, -1.0f, 0.0f, 4.0f};
   std::copy(projection, projection + 6, map.projection.data());
-  // f - mean = (1, -2, 0.5); delta = (1 - 4 + 0, 0.5 + 2 + 2) = (-3, 4.5).
   const float feature[] = {2.0f, 0.0f, 3.5f};
   std::vector<float> shape = {10.0f, 20.0f};
   applyStage(feature, map, Row({0.25f, -0.5f}), shape);
   EXPECT_EQ(shape, (std::vector<float>{10.0f + (0.25f + -3.0f), 20.0f + (-0.5f + 4.5f)}));
-  // A bias of another size is skipped.
   shape = {10.0f, 20.0f};
   applyStage(feature, map, Row({1.0f, 1.0f, 1.0f}), shape);
   EXPECT_EQ(shape, (std::vector<float>{7.0f, 24.5f}));
 }
 
-TEST(RegressShapesTest, NoStagesGiveTheMedianOfTheStartsAndAStageMovesByBiasMinusMean) {
+// fitFace scales the unit to the face width (the box's fields truncated),
+// regresses there and scales the shape back: with no stages, the median of
+// the starts. A stage on a flat image, whose descriptors are all below the
+// norm floor, moves every start by bias - mean * P (the feature row is 0), in
+// the image padded by 0.4 of its 120 columns; without stage matrices the bias
+// is not applied.
+TEST(FitFaceTest, RegressesAtTheFaceWidthAndAStageMovesByBiasMinusMean) {
   SDMModel model;
   model.meanShape = kMean;
-  const std::vector<std::vector<float>> starts = startShapes(kMean, cv::Rect(20, 30, 60, 60));
+  model.faceWidth = 60;
+  GeneralUnit unit;
+  unit.image = Flat(100, 80);
+  unit.faceRect = cv::Rect(10, 21, 40, 30);
+  const std::vector<float> result = fitFace(model, unit);
+  EXPECT_EQ(unit.scale, 1.5f);
+  EXPECT_EQ(unit.image.size(), cv::Size(120, 150));
+  EXPECT_EQ(unit.faceRect, cv::Rect(15, 31, 60, 45));
+  const std::vector<std::vector<float>> starts = startShapes(kMean, unit.faceRect);
   const std::vector<float> median = coordinateMedian(starts);
-  EXPECT_EQ(regressShapes(model, Flat(120, 100), starts), median);
-  // Every descriptor of a flat image is below the norm floor, the buffer keeps
-  // its zeros and the feature row is 0: delta = -mean * P, the same for every
-  // start.
+  for (size_t q = 0; q < median.size(); ++q) EXPECT_EQ(result[q], median[q] / 1.5f) << q;
+
   model.stageMaps.push_back(IdentityMap({0.5f, -1.0f, 2.0f, 0.0f, -3.0f, 1.5f}));
   model.stageBiases.push_back(Row({1.0f, 1.0f, 1.0f, 1.0f, 1.0f, 1.0f}));
   model.stageMatrices.push_back(mp::matrix(1, 1));
-  const float pad = 40.0f;  // 0.4 * 100 columns
+  const float pad = 48.0f;
   const float minusMean[] = {-0.5f, 1.0f, -2.0f, -0.0f, 3.0f, -1.5f};
-  const std::vector<float> result = regressShapes(model, Flat(120, 100), starts);
-  for (size_t q = 0; q < median.size(); ++q) {
-    EXPECT_EQ(result[q], ((median[q] + pad) + (1.0f + minusMean[q])) - pad) << q;
-  }
-  // Without stage matrices the bias is not applied.
+  const std::vector<float> biased = regressShapes(model, unit.image, starts);
   model.stageMatrices.clear();
-  const std::vector<float> unbiased = regressShapes(model, Flat(120, 100), starts);
+  const std::vector<float> unbiased = regressShapes(model, unit.image, starts);
   for (size_t q = 0; q < median.size(); ++q) {
+    EXPECT_EQ(biased[q], ((median[q] + pad) + (1.0f + minusMean[q])) - pad) << q;
     EXPECT_EQ(unbiased[q], ((median[q] + pad) + minusMean[q]) - pad) << q;
   }
 }
@@ -136,34 +145,32 @@ mp::pca_map BlockSumMap() {
   return map;
 }
 
-TEST(RegressShapesTest, APointWithoutGradientsRepeatsThePreviousDescriptor) {
-  // Point 1 lies in the flat part, so its block repeats point 0's bytes and
-  // both move by the same sum (a multiple of 1/256, exact in floats).
+// Features are descriptor bytes over 256, so a point moves by a whole number
+// of 256ths (exact in floats). Point 1 lies in the flat part and repeats
+// point 0's bytes. Stages beyond the level list take its last entry; only the
+// levels that stages ask for are blurred.
+TEST(RegressShapesTest, FeaturesAreBytesOver256RepeatedWithoutGradientsAtEachStagesLevel) {
   SDMModel model;
   model.meanShape = {0.0f, 0.0f, 0.0f, 0.0f};
   model.stageMaps.push_back(BlockSumMap());
   model.stageLevels = {0};
-  const std::vector<float> start = {40.0f, 50.0f, 160.0f, 50.0f};
+  std::vector<float> start = {40.0f, 50.0f, 160.0f, 50.0f};
   const std::vector<float> result = regressShapes(model, HalfTextured(), {start});
-  EXPECT_GT(result[0] - start[0], 1.0f);
-  EXPECT_EQ(result[2] - start[2], result[0] - start[0]);
+  const float moved = result[0] - start[0];
+  EXPECT_GT(moved, 1.0f);
+  EXPECT_EQ(moved * 256.0f, std::floor(moved * 256.0f));
+  EXPECT_EQ(result[2] - start[2], moved);
   EXPECT_EQ(result[1], start[1]);
   EXPECT_EQ(result[3], start[3]);
-}
 
-TEST(RegressShapesTest, StagesTakeTheirLevelsAndThoseBeyondTheListItsLast) {
-  SDMModel model;
-  model.meanShape = {0.0f, 0.0f, 0.0f, 0.0f};
   model.stageMaps.assign(3, BlockSumMap());
-  const std::vector<float> start = {40.0f, 50.0f, 60.0f, 30.0f};
+  start = {40.0f, 50.0f, 60.0f, 30.0f};
   model.stageLevels = {0, 2, 2};
   const std::vector<float> spelled = regressShapes(model, HalfTextured(), {start});
   model.stageLevels = {0, 2};
   EXPECT_EQ(regressShapes(model, HalfTextured(), {start}), spelled);
   model.stageLevels = {0, 2, 0};
   EXPECT_NE(regressShapes(model, HalfTextured(), {start}), spelled);
-  // Only the levels that stages ask for are blurred: one more stage that
-  // moves nothing but asks for the top level changes nothing.
   model.stageLevels = {0, 2, 2, 5};
   model.stageMaps.push_back(BlockSumMap());
   model.stageMaps.back().projection.fill(0.0f);
@@ -210,44 +217,6 @@ TEST(RegressShapesTest, StartsTakenTogetherPlaceTheShippedModelsPointsAsOneByOne
     ASSERT_EQ(together.size(), 136u);
     for (size_t q = 0; q < together.size(); ++q) EXPECT_NEAR(together[q], oneByOne[q], 0.01f) << q;
   }
-}
-
-// The unit is scaled to the face width (the box's fields truncated), regressed
-// there, and its shapes scaled back.
-TEST(FitFaceTest, RegressesAtTheFaceWidthAndAnswersInTheUnitsPixels) {
-  SDMModel model;
-  model.meanShape = kMean;
-  model.faceWidth = 60;
-  GeneralUnit unit;
-  unit.image = Flat(100, 80);
-  unit.faceRect = cv::Rect(10, 21, 40, 30);
-  const std::vector<float> result = fitFace(model, unit);
-  EXPECT_EQ(unit.scale, 1.5f);
-  EXPECT_EQ(unit.image.size(), cv::Size(120, 150));
-  EXPECT_EQ(unit.faceRect, cv::Rect(15, 31, 60, 45));
-  std::vector<float> expected = coordinateMedian(startShapes(kMean, unit.faceRect));
-  for (float& v : expected) v /= 1.5f;
-  EXPECT_EQ(result, expected);
-}
-
-// Features are the descriptor bytes over 256: every one times 256 is a whole
-// number below 256, and a textured image gives some that are not 0.
-TEST(FaceFeaturesTest, AreDescriptorBytesOver256) {
-  cv::Mat noise(120, 120, CV_8UC1);
-  cv::randu(noise, 0, 256);
-  const std::vector<float> shape = {40.0f, 50.0f, 70.0f, 60.0f};
-  FaceFeatures features(noise, shape, 3, 1);
-  std::vector<float> padded = shape;
-  for (float& v : padded) v += static_cast<float>(features.pad());
-  std::vector<float> row(2 * 128);
-  features.compute(padded, 1, row.data());
-  float largest = 0.0f;
-  for (float value : row) {
-    ASSERT_EQ(value * 256.0f, std::floor(value * 256.0f)) << value;
-    ASSERT_LT(value * 256.0f, 256.0f);
-    largest = std::max(largest, value);
-  }
-  EXPECT_GT(largest, 0.0f);
 }
 
 }  // namespace
