@@ -39,8 +39,8 @@ extern "C" int LLVMFuzzerTestOneInput(const uint8_t* data, size_t size) {
   static const TempDir dir;
   static TestModelFolder folder(dir);
   static const bool built = [] {
-    folder.addScanStage("scan", 120);
-    folder.addConstantStage("grade", 3.0f);
+    folder.addScanStage("scan");
+    folder.addConstantStage("grade", {0.0f, 3.0f});
     folder.addCalibration(4);
     return true;
   }();
