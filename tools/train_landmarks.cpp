@@ -77,6 +77,8 @@ int main(int argc, char** argv) {
       "face-width", po::value<int32_t>(&settings.faceWidth)->default_value(100),
       "face box width the face is normalised to")(
       "ridge", po::value<double>(&settings.ridge)->default_value(1e-2), "ridge strength per shape")(
+      "folds", po::value<int>(&settings.folds)->default_value(1),
+      "shapes reach the next stage as a fit without their person's fold moves them")(
       "seed", po::value<unsigned>(&seed)->default_value(1), "random seed")(
       "lfw", po::bool_switch(&withLfw),
       "also learn from lfw68 (machine-made points), without the persons of faces68 val");
@@ -85,6 +87,9 @@ int main(int argc, char** argv) {
       return 0;
     }
     settings.stageLevels = parseLevels(levels);
+    if (settings.folds < 1) {
+      throw po::error("--folds needs at least one fold");
+    }
     const auto start = std::chrono::steady_clock::now();
     landmarks::LabelledImages labelled;
     const std::set<std::string> validationPersons =
@@ -130,6 +135,7 @@ int main(int argc, char** argv) {
           mirrored(box, images[i].cols), landmarks::jitteredBox(flippedFace, error, random)};
       for (int b = 0; b < 4; ++b) {
         landmarks::LandmarkSample sample;
+        sample.person = labelled.persons[i];
         if (landmarks::makeSample(*views[b / 2].first, boxes[b], *views[b / 2].second,
                                   settings.faceWidth, &sample)) {
           samples.push_back(std::move(sample));

@@ -21,12 +21,15 @@ namespace landmarks {
 namespace {
 
 // Targets exactly bias + (x - 0.5) P, as a stage moves a shape: the fit gives
-// P back, and its stage reproduces every target.
-TEST(FitStageTest, RecoversAnExactlyLinearMap) {
+// P back, its stage reproduces every target, and so do the steps it returns,
+// those of the whole fit and those of fits without a row's fold (folds of
+// other means, so that the recentring counts).
+TEST(FitStageTest, RecoversAnExactlyLinearMapWholeAndWithoutEachFold) {
   const int rows = 400, columns = 12, outputs = 3;
   cv::RNG random(5);
   std::vector<float> features(rows * columns), targets;
   random.fill(cv::Mat(1, rows * columns, CV_32F, features.data()), cv::RNG::UNIFORM, 0.0f, 1.0f);
+  for (int r = 0; r < 150; ++r) features[r * columns] += 2.0f;
   mp::pca_map truth;
   truth.mean = mp::matrix(1, columns);
   truth.mean.fill(0.5f);
@@ -39,17 +42,23 @@ TEST(FitStageTest, RecoversAnExactlyLinearMap) {
     SDMCore::applyStage(features.data() + r * columns, truth, bias, target);
     targets.insert(targets.end(), target.begin(), target.end());
   }
-  mp::pca_map map;
-  mp::matrix fittedBias;
-  std::vector<float> centred = features;
-  fitStage(centred, targets, rows, columns, outputs, 1e-9, &map, &fittedBias);
-  for (int i = 0; i < columns * outputs; ++i) {
-    EXPECT_NEAR(map.projection.data()[i], truth.projection.data()[i], 1e-3) << i;
-  }
-  for (int r = 0; r < rows; r += 7) {
-    std::vector<float> shape(outputs);
-    SDMCore::applyStage(features.data() + r * columns, map, fittedBias, shape);
-    for (int q = 0; q < outputs; ++q) EXPECT_NEAR(shape[q], targets[r * outputs + q], 1e-3) << r;
+  for (const std::vector<size_t>& foldEnds : {std::vector<size_t>{400}, std::vector<size_t>{150, 400}}) {
+    mp::pca_map map;
+    mp::matrix fittedBias;
+    std::vector<float> centred = features;
+    const std::vector<float> steps =
+        fitStage(centred, targets, foldEnds, columns, outputs, 1e-9, &map, &fittedBias);
+    for (int i = 0; i < columns * outputs; ++i) {
+      EXPECT_NEAR(map.projection.data()[i], truth.projection.data()[i], 1e-3) << i;
+    }
+    for (int r = 0; r < rows; r += 7) {
+      std::vector<float> shape(outputs);
+      SDMCore::applyStage(features.data() + r * columns, map, fittedBias, shape);
+      for (int q = 0; q < outputs; ++q) {
+        EXPECT_NEAR(shape[q], targets[r * outputs + q], 1e-3) << r;
+        EXPECT_NEAR(steps[r * outputs + q], targets[r * outputs + q], 1e-3) << r << " of " << foldEnds.size();
+      }
+    }
   }
 }
 

@@ -13,7 +13,6 @@ namespace training {
 
 namespace {
 
-constexpr float kNegativeIoU = 0.3f;
 // Random negatives are at least this large in the image, the smallest face
 // the detector is asked for.
 constexpr int kSmallestFace = 20;
@@ -136,7 +135,7 @@ WindowSet faceImageWindows(const FaceImage& face, const StageRecipe& recipe,
     const float overlap = intersectionOverUnion(rect, face.box);
     if (overlap >= recipe.minPositiveIoU) {
       positives.push_back(window);
-    } else if (overlap < kNegativeIoU && (rect & face.box).area() > 0.0f) {
+    } else if (overlap < recipe.maxNegativeIoU && (rect & face.box).area() > 0.0f) {
       negatives.push_back(window);
     }
   }

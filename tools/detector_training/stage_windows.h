@@ -23,13 +23,17 @@ struct StageRecipe {
   // Windows the cascade so far hands on, kept per image: from negative
   // images (all negatives), and from face images (IoU at least
   // minPositiveIoU with the face: positives; overlapping it with IoU below
-  // 0.3: negatives). 0 for the first stage, which has no cascade before it.
+  // maxNegativeIoU: negatives). 0 for the first stage, which has no cascade
+  // before it.
   int minedPerNegativeImage;
   int minedPerFaceImage;
   float minPositiveIoU;
   // Non-face images are mined as they are (1), also mirrored (2), and both
   // again scaled by half a pyramid step (4).
   int miningVariants = 1;
+  // A last grader that rejects near misses makes the final merge, which
+  // keeps the best-scored of overlapping windows, keep the well-placed one.
+  float maxNegativeIoU = 0.3f;
 };
 
 // Positives for one epoch: faces and crops moved within the recipe's jitter,

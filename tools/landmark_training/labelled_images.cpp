@@ -13,6 +13,8 @@ void addLabelledImages(const std::string& csvPath, const std::set<std::string>& 
       continue;
     }
     labelled->images.push_back(training::readImage(folder + face.file));
+    labelled->persons.push_back(
+        labelled->personNumbers.emplace(face.person, labelled->personNumbers.size()).first->second);
     std::vector<float> flat;
     for (const cv::Point2f& point : face.points) {
       flat.push_back(point.x);

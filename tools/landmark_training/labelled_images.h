@@ -3,6 +3,7 @@
 
 #include <opencv2/core.hpp>
 
+#include <map>
 #include <set>
 #include <string>
 #include <vector>
@@ -10,11 +11,14 @@
 namespace landmarks {
 
 // Decoded frames with their 68 points (x0, y0, ... in image pixels) and the
-// face box convention of those points.
+// face box convention of those points, and the persons they show, numbered
+// in order of appearance.
 struct LabelledImages {
   std::vector<cv::Mat> images;
+  std::vector<size_t> persons;
   std::vector<std::vector<float>> truths;
   std::vector<cv::Rect2f> faces;
+  std::map<std::string, size_t> personNumbers;
 };
 
 // Adds the faces of a CSV of the data folder (relative image paths resolved

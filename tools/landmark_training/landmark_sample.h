@@ -16,6 +16,9 @@ struct LandmarkSample {
   cv::Mat image;
   cv::Rect faceRect;
   std::vector<float> truth;
+  // Which person it shows, by number: training keeps a person's faces in one
+  // fold.
+  size_t person = 0;
 };
 
 // Prepares the face at rect of an 8-bit 3-channel image with its 68 true
