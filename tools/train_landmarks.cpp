@@ -22,6 +22,7 @@
 
 #include "alignment/sdm_model.h"
 #include "command_line.h"
+#include "detector_training/face_box.h"
 #include "landmark_training/labelled_images.h"
 #include "landmark_training/landmark_sample.h"
 #include "landmark_training/sdm_training.h"
@@ -53,6 +54,19 @@ tavilib::Rectangle<float> mirrored(const tavilib::Rectangle<float>& box, int col
           box.bottom};
 }
 
+cv::Rect2f faceBoxOf(const std::vector<float>& points) {
+  std::vector<cv::Point2f> corners;
+  for (size_t k = 0; k + 1 < points.size(); k += 2) corners.emplace_back(points[k], points[k + 1]);
+  return training::faceBoxFromPoints(corners);
+}
+
+// A face as one sample sees it.
+struct View {
+  cv::Mat image;
+  std::vector<float> points;
+  tavilib::Rectangle<float> box{};
+};
+
 }  // namespace
 
 int main(int argc, char** argv) {
@@ -62,6 +76,7 @@ int main(int argc, char** argv) {
   std::string levels;
   unsigned seed = 1;
   bool withLfw = false;
+  double roll = 0.0;
   landmarks::SdmSettings settings;
   po::options_description described("train_landmarks: trains the 68-point landmark model");
   described.add_options()("help", "this text")(
@@ -77,6 +92,8 @@ int main(int argc, char** argv) {
       "face-width", po::value<int32_t>(&settings.faceWidth)->default_value(100),
       "face box width the face is normalised to")(
       "ridge", po::value<double>(&settings.ridge)->default_value(1e-2), "ridge strength per shape")(
+      "roll", po::value<double>(&roll)->default_value(0.0),
+      "the samples with moved boxes show the face turned by up to this many degrees")(
       "folds", po::value<int>(&settings.folds)->default_value(1),
       "shapes reach the next stage as a fit without their person's fold moves them")(
       "seed", po::value<unsigned>(&seed)->default_value(1), "random seed")(
@@ -115,29 +132,34 @@ int main(int argc, char** argv) {
 
     // Each face twice, upright and mirrored, each with the detector's box
     // (or the face box moved by the detector's error where it found none)
-    // and once more with a box moved by that error.
+    // and once more with a box moved by that error, the face turned by up to
+    // --roll degrees first.
     std::mt19937 random(seed);
+    std::uniform_real_distribution<double> turn(-roll, roll);
     std::vector<landmarks::LandmarkSample> samples;
     size_t skipped = 0;
     for (size_t i = 0; i < images.size(); ++i) {
-      cv::Mat flipped;
-      std::vector<float> flippedTruth;
-      landmarks::mirrorFace(images[i], truths[i], &flipped, &flippedTruth);
+      View views[4];
+      views[0] = {images[i], truths[i]};
+      landmarks::mirrorFace(images[i], truths[i], &views[2].image, &views[2].points);
       const bool hasBox = found[i].right > found[i].left;
-      const tavilib::Rectangle<float> box =
-          hasBox ? found[i] : landmarks::jitteredBox(faces[i], error, random);
-      const cv::Rect2f flippedFace(static_cast<float>(images[i].cols) - faces[i].br().x,
-                                   faces[i].y, faces[i].width, faces[i].height);
-      const std::pair<const cv::Mat*, const std::vector<float>*> views[] = {
-          {&images[i], &truths[i]}, {&flipped, &flippedTruth}};
-      const tavilib::Rectangle<float> boxes[] = {
-          box, landmarks::jitteredBox(faces[i], error, random),
-          mirrored(box, images[i].cols), landmarks::jitteredBox(flippedFace, error, random)};
-      for (int b = 0; b < 4; ++b) {
+      views[0].box = hasBox ? found[i] : landmarks::jitteredBox(faces[i], error, random);
+      views[2].box = mirrored(views[0].box, images[i].cols);
+      for (int v = 1; v < 4; v += 2) {
+        const View& upright = views[v - 1];
+        if (roll > 0.0) {
+          landmarks::rotateFace(upright.image, upright.points, turn(random), &views[v].image,
+                                &views[v].points);
+        } else {
+          views[v].image = upright.image;
+          views[v].points = upright.points;
+        }
+        views[v].box = landmarks::jitteredBox(faceBoxOf(views[v].points), error, random);
+      }
+      for (const View& view : views) {
         landmarks::LandmarkSample sample;
         sample.person = labelled.persons[i];
-        if (landmarks::makeSample(*views[b / 2].first, boxes[b], *views[b / 2].second,
-                                  settings.faceWidth, &sample)) {
+        if (landmarks::makeSample(view.image, view.box, view.points, settings.faceWidth, &sample)) {
           samples.push_back(std::move(sample));
         } else {
           ++skipped;

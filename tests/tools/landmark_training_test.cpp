@@ -3,6 +3,7 @@
 #include <opencv2/core.hpp>
 
 #include <algorithm>
+#include <cmath>
 #include <filesystem>
 #include <fstream>
 #include <string>
@@ -60,6 +61,27 @@ TEST(FitStageTest, RecoversAnExactlyLinearMapWholeAndWithoutEachFold) {
       }
     }
   }
+}
+
+// The points go where the pixels under them go, mirrored (with the sides'
+// indices swapped) or turned.
+TEST(LandmarkSampleTest, PointsFollowTheirPixels) {
+  cv::Mat image(60, 80, CV_8UC3, cv::Scalar(0, 0, 0));
+  std::vector<float> points(136, 30.0f);
+  points[2 * 36] = 20.0f;  // the right eye's outer corner, a bright pixel
+  points[2 * 36 + 1] = 25.0f;
+  image.at<cv::Vec3b>(25, 20) = cv::Vec3b(255, 255, 255);
+  cv::Mat moved;
+  std::vector<float> movedPoints;
+  mirrorFace(image, points, &moved, &movedPoints);
+  EXPECT_EQ(movedPoints[2 * 45], 59.0f);
+  EXPECT_EQ(movedPoints[2 * 45 + 1], 25.0f);
+  EXPECT_EQ(moved.at<cv::Vec3b>(25, 59)[0], 255);
+  rotateFace(image, points, 90.0, &moved, &movedPoints);
+  const int x = static_cast<int>(std::lround(movedPoints[2 * 36]));
+  const int y = static_cast<int>(std::lround(movedPoints[2 * 36 + 1]));
+  EXPECT_GT(moved.at<cv::Vec3b>(y, x)[0], 100) << x << "," << y;
+  EXPECT_NE(x, 20);
 }
 
 const char kValidationCsv[] = TAVI_SOURCE_DIR "/../shared/data/faces68/val.csv";

@@ -1,5 +1,7 @@
 #include "landmark_training/landmark_sample.h"
 
+#include <opencv2/imgproc.hpp>
+
 #include "alignment/alignment_frame.h"
 #include "alignment/sdm_regression.h"
 
@@ -58,6 +60,26 @@ void mirrorFace(const cv::Mat& image, const std::vector<float>& points, cv::Mat*
   for (size_t k = 0; k < source.size(); ++k) {
     (*mirroredPoints)[2 * k] = static_cast<float>(image.cols - 1) - points[2 * source[k]];
     (*mirroredPoints)[2 * k + 1] = points[2 * source[k] + 1];
+  }
+}
+
+void rotateFace(const cv::Mat& image, const std::vector<float>& points, double degrees,
+                cv::Mat* rotatedImage, std::vector<float>* rotatedPoints) {
+  cv::Point2d centre(0.0, 0.0);
+  for (size_t k = 0; k + 1 < points.size(); k += 2) {
+    centre += cv::Point2d(points[k], points[k + 1]);
+  }
+  centre *= 2.0 / static_cast<double>(points.size());
+  const cv::Mat turn = cv::getRotationMatrix2D(centre, degrees, 1.0);
+  cv::warpAffine(image, *rotatedImage, turn, image.size(), cv::INTER_LINEAR, cv::BORDER_REFLECT_101);
+  rotatedPoints->resize(points.size());
+  for (size_t k = 0; k + 1 < points.size(); k += 2) {
+    const double x = points[k];
+    const double y = points[k + 1];
+    (*rotatedPoints)[k] = static_cast<float>(turn.at<double>(0, 0) * x + turn.at<double>(0, 1) * y +
+                                             turn.at<double>(0, 2));
+    (*rotatedPoints)[k + 1] = static_cast<float>(turn.at<double>(1, 0) * x +
+                                                 turn.at<double>(1, 1) * y + turn.at<double>(1, 2));
   }
 }
 

@@ -33,6 +33,11 @@ bool makeSample(const cv::Mat& image, const tavilib::Rectangle<float>& rect,
 void mirrorFace(const cv::Mat& image, const std::vector<float>& points, cv::Mat* mirroredImage,
                 std::vector<float>* mirroredPoints);
 
+// The image turned by degrees (counter-clockwise as seen) about the centre
+// of its points, with the points; the borders are mirrored in.
+void rotateFace(const cv::Mat& image, const std::vector<float>& points, double degrees,
+                cv::Mat* rotatedImage, std::vector<float>* rotatedPoints);
+
 }  // namespace landmarks
 
 #endif  // TOOLS_LANDMARK_TRAINING_LANDMARK_SAMPLE_H_
