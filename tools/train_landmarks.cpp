@@ -94,7 +94,7 @@ int main(int argc, char** argv) {
       "ridge", po::value<double>(&settings.ridge)->default_value(1e-2), "ridge strength per shape")(
       "roll", po::value<double>(&roll)->default_value(0.0),
       "the samples with moved boxes show the face turned by up to this many degrees")(
-      "folds", po::value<int>(&settings.folds)->default_value(1),
+      "folds", po::value<int>(&settings.folds)->default_value(5),
       "shapes reach the next stage as a fit without their person's fold moves them")(
       "seed", po::value<unsigned>(&seed)->default_value(1), "random seed")(
       "lfw", po::bool_switch(&withLfw),
