@@ -55,6 +55,15 @@ struct RowMoments {
   std::vector<double> moment;
   std::vector<double> featureSum;
   std::vector<double> targetSum;
+
+  RowMoments& operator+=(const RowMoments& other) {
+    rows += other.rows;
+    for (size_t i = 0; i < gram.size(); ++i) gram[i] += other.gram[i];
+    for (size_t i = 0; i < moment.size(); ++i) moment[i] += other.moment[i];
+    for (size_t c = 0; c < featureSum.size(); ++c) featureSum[c] += other.featureSum[c];
+    for (size_t q = 0; q < targetSum.size(); ++q) targetSum[q] += other.targetSum[q];
+    return *this;
+  }
 };
 
 RowMoments momentsOf(const float* features, const float* targets, size_t rows, size_t columns,
@@ -173,13 +182,9 @@ std::vector<float> fitStage(std::vector<float>& features, const std::vector<floa
                               outputs));
     if (f == 0) {
       all = folds[0];
-      continue;
+    } else {
+      all += folds[f];
     }
-    all.rows += folds[f].rows;
-    for (size_t i = 0; i < all.gram.size(); ++i) all.gram[i] += folds[f].gram[i];
-    for (size_t i = 0; i < all.moment.size(); ++i) all.moment[i] += folds[f].moment[i];
-    for (size_t c = 0; c < columns; ++c) all.featureSum[c] += folds[f].featureSum[c];
-    for (size_t q = 0; q < outputs; ++q) all.targetSum[q] += folds[f].targetSum[q];
   }
   std::vector<double> featureMean;
   std::vector<double> targetMean;
@@ -187,8 +192,8 @@ std::vector<float> fitStage(std::vector<float>& features, const std::vector<floa
 
   // Each fold's rows step as a model fit without them would step them.
   std::vector<float> steps(rows * outputs);
+  const bool heldOut = foldEnds.size() > 1;
   for (size_t f = 0, begin = 0; f < foldEnds.size(); begin = foldEnds[f++]) {
-    const bool heldOut = foldEnds.size() > 1;
     const mp::matrix projection =
         heldOut ? solveWithout(all, &folds[f], ridge, &featureMean, &targetMean) : map->projection;
     addSteps(features.data() + begin * columns, foldEnds[f] - begin, columns, projection,
