@@ -173,21 +173,32 @@ TEST(NetTrainerTest, LearnsAndExportsAScanNetWhoseStoredResponseVanishes) {
 }
 
 TEST(NetTrainerTest, RaisingTheFaceLogitMovesEveryProbabilityByTheSameOdds) {
-  NetTrainer trainer(tavilib::kStage1NetText, 24, false, NetTrainingSettings(), std::vector<float>(1728, 0.0f));
-  nn::NetParameter weights = trainer.deployWeights();
   const double shift = logOdds(0.98f) - logOdds(0.95f);
   EXPECT_NEAR(shift, 0.9474, 1e-4);
-  nn::Net<float> before(Declared(tavilib::kStage1NetText, 24, 24));
-  nn::Net<float> after(Declared(tavilib::kStage1NetText, 24, 24));
-  before.CopyTrainedLayersFrom(weights);
-  raiseFaceLogit(weights, shift);
-  after.CopyTrainedLayersFrom(weights);
-  for (int trial = 0; trial < 5; ++trial) {
-    FillRandom(*before.net_input_blobs()[0], trial + 1, -100.0f, 100.0f);
-    FillRandom(*after.net_input_blobs()[0], trial + 1, -100.0f, 100.0f);
-    const float p = before.Forward()[0]->cpu_data()[1];
-    const float raised = after.Forward()[0]->cpu_data()[1];
-    EXPECT_NEAR(logOdds(raised), logOdds(p) + shift, 1e-3) << trial;
+  // A grader's one probability, and every cell of the scan net's map.
+  for (const bool scan : {false, true}) {
+    const char* text = scan ? tavilib::kStage0NetText : tavilib::kStage1NetText;
+    const int side = scan ? 12 : 24;
+    NetTrainer trainer(text, side, scan, NetTrainingSettings(),
+                       std::vector<float>(3 * side * side, 0.0f));
+    nn::NetParameter weights = trainer.deployWeights();
+    nn::Net<float> before(Declared(text, 24, 24));
+    nn::Net<float> after(Declared(text, 24, 24));
+    before.CopyTrainedLayersFrom(weights);
+    raiseFaceLogit(weights, shift);
+    after.CopyTrainedLayersFrom(weights);
+    for (int trial = 0; trial < 5; ++trial) {
+      FillRandom(*before.net_input_blobs()[0], trial + 1, -100.0f, 100.0f);
+      FillRandom(*after.net_input_blobs()[0], trial + 1, -100.0f, 100.0f);
+      const nn::Blob<float>& p = *before.Forward()[0];
+      const nn::Blob<float>& raised = *after.Forward()[0];
+      const int cells = p.count() / 2;
+      EXPECT_EQ(cells, scan ? 9 : 1);
+      for (int cell = cells; cell < 2 * cells; ++cell) {
+        EXPECT_NEAR(logOdds(raised.cpu_data()[cell]), logOdds(p.cpu_data()[cell]) + shift, 1e-3)
+            << scan << " " << trial << " " << cell;
+      }
+    }
   }
 }
 

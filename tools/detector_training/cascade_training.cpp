@@ -61,9 +61,9 @@ std::vector<StagePlan> cascadeStages() {
   lastGrader.baseLr = 0.005f;
   lastGrader.positiveWeight = 4.0f;
   return {
-      {"cascades/x16Net-demo", tavilib::kStage0NetText, Role::kScan, 0.4f, 0.4f, 15, scan,
+      {"cascades/x16Net-demo", tavilib::kStage0NetText, Role::kScan, 0.4f, 0.2f, 15, scan,
        {12, 2, {0.2f, 0.15f}, 60, 3, 0, 0, 0.0f}},
-      {"cascades/x32Net", tavilib::kStage1NetText, Role::kGrader, 0.8f, 0.8f, 10, grader,
+      {"cascades/x32Net", tavilib::kStage1NetText, Role::kGrader, 0.8f, 0.3f, 10, grader,
        {24, 2, {0.2f, 0.15f}, 10, 1, 40, 4, 0.5f}},
       {"cascades/x32Net-x32-3Scales-200", tavilib::kCalibrationNetText, Role::kCalibration, 0.0f, 0.0f, 40,
        calibration, {24, 0, {0.0f, 0.0f}, 0, 0, 0, 0, 0.0f}},

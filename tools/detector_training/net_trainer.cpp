@@ -258,9 +258,12 @@ void raiseFaceLogit(nn::NetParameter& weights, double shift) {
     --last;
   }
   nn::LayerParameter& layer = *weights.mutable_layers(last);
-  CHECK(layer.type() == nn::LayerParameter::INNER_PRODUCT && layer.blobs_size() == 2 &&
-        layer.blobs(1).data_size() == 2)
-      << "The face logit is the second output of a two-class inner product.";
+  // A grader ends in an inner product, the scan net in a convolution that
+  // gives the two logits of every cell.
+  CHECK((layer.type() == nn::LayerParameter::INNER_PRODUCT ||
+         layer.type() == nn::LayerParameter::CONVOLUTION) &&
+        layer.blobs_size() == 2 && layer.blobs(1).data_size() == 2)
+      << "The face logit is the second output of a two-class inner product or convolution.";
   nn::BlobProto& bias = *layer.mutable_blobs(1);
   bias.set_data(1, static_cast<float>(bias.data(1) + shift));
 }

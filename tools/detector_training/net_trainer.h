@@ -96,7 +96,7 @@ double logOdds(float probability);
 // Adds shift to the face logit (class 1) of a two-class net's weights, the
 // bias of its last layer with weights: every face probability p becomes the
 // one whose log-odds are those of p plus shift.
-// Fatal if that layer is not an inner product with two outputs.
+// Fatal if that layer is not an inner product or convolution with two outputs.
 void raiseFaceLogit(nn::NetParameter& weights, double shift);
 
 }  // namespace training

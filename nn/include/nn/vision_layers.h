@@ -88,6 +88,7 @@ class PoolingLayer : public Layer<Dtype> {
 
  private:
   void ComputePooledSize();
+  void MaxPoolPlane(const Dtype* bottom, Dtype* top);
 
   int kernel_size_ = 0;
   int stride_ = 0;
@@ -98,6 +99,8 @@ class PoolingLayer : public Layer<Dtype> {
   int pooled_height_ = 0;
   int pooled_width_ = 0;
   Blob<Dtype> rand_idx_;
+  // One row of column maxima, for the widest input (set-up's).
+  std::vector<Dtype> column_max_;
 };
 
 // Local response normalisation, across channels (by a sliding window sum of

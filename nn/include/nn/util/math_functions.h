@@ -48,6 +48,10 @@ void nn_rng_bernoulli(int n, float p, int* r);
 // position. Padding cells are written as zeros; every cell is written.
 void im2col(const float* data_im, int channels, int height, int width, int ksize, int pad,
             int stride, float* data_col);
+// The same for the output rows [row_begin, row_end) only: the columns of
+// those rows, packed, (row_end - row_begin) * width_col to a channel row.
+void im2col_rows(const float* data_im, int channels, int height, int width, int ksize, int pad,
+                 int stride, int row_begin, int row_end, float* data_col);
 // The adjoint of im2col: clears data_im and sums each column cell back into
 // its pixel.
 void col2im(const float* data_col, int channels, int height, int width, int ksize, int pad,

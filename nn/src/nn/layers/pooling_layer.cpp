@@ -36,6 +36,7 @@ void PoolingLayer<Dtype>::SetUp(const std::vector<Blob<Dtype>*>& bottom,
   height_ = bottom[0]->height();
   width_ = bottom[0]->width();
   ComputePooledSize();
+  column_max_.resize(width_);
   (*top)[0]->Reshape(bottom[0]->num(), channels_, pooled_height_, pooled_width_);
   if (param.pool() == PoolingParameter_PoolMethod_STOCHASTIC) {
     rand_idx_.Reshape(bottom[0]->num(), channels_, pooled_height_, pooled_width_);
@@ -76,6 +77,36 @@ AverageWindow AveWindow(int ph, int pw, int stride, int pad, int kernel_size, in
 
 }  // namespace
 
+// The maximum of the window's rows first, column by column (a loop the
+// compiler turns into vector maxima), then of those along each window. Taking
+// the maximum in another order gives the same value: the comparison is
+// strictly greater, so a NaN never enters either way.
+template <typename Dtype>
+void PoolingLayer<Dtype>::MaxPoolPlane(const Dtype* bottom, Dtype* top) {
+  Dtype* column_max = column_max_.data();
+  for (int ph = 0; ph < pooled_height_; ++ph) {
+    const int hstart = ph * stride_;
+    const int hend = std::min(hstart + kernel_size_, height_);
+    // A window wholly outside the image keeps the lowest float.
+    std::fill(column_max, column_max + width_, std::numeric_limits<Dtype>::lowest());
+    for (int h = hstart; h < hend; ++h) {
+      const Dtype* row = bottom + h * width_;
+      for (int w = 0; w < width_; ++w) {
+        column_max[w] = row[w] > column_max[w] ? row[w] : column_max[w];
+      }
+    }
+    for (int pw = 0; pw < pooled_width_; ++pw) {
+      const int wstart = pw * stride_;
+      const int wend = std::min(wstart + kernel_size_, width_);
+      Dtype out = std::numeric_limits<Dtype>::lowest();
+      for (int w = wstart; w < wend; ++w) {
+        out = column_max[w] > out ? column_max[w] : out;
+      }
+      top[ph * pooled_width_ + pw] = out;
+    }
+  }
+}
+
 template <typename Dtype>
 Dtype PoolingLayer<Dtype>::Forward_cpu(const std::vector<Blob<Dtype>*>& bottom,
                                        std::vector<Blob<Dtype>*>* top) {
@@ -84,29 +115,10 @@ Dtype PoolingLayer<Dtype>::Forward_cpu(const std::vector<Blob<Dtype>*>& bottom,
   const int images = bottom[0]->num();
   switch (this->layer_param_.pooling_param().pool()) {
     case PoolingParameter_PoolMethod_MAX:
-      for (int n = 0; n < images; ++n) {
-        for (int c = 0; c < channels_; ++c) {
-          for (int ph = 0; ph < pooled_height_; ++ph) {
-            const int hstart = ph * stride_;
-            const int hend = std::min(hstart + kernel_size_, height_);
-            for (int pw = 0; pw < pooled_width_; ++pw) {
-              const int wstart = pw * stride_;
-              const int wend = std::min(wstart + kernel_size_, width_);
-              // A window wholly outside the image keeps the lowest float.
-              Dtype out = std::numeric_limits<Dtype>::lowest();
-              for (int h = hstart; h < hend; ++h) {
-                const Dtype* row = bottom_data + h * width_;
-                for (int w = wstart; w < wend; ++w) {
-                  // Strictly greater: a NaN never enters.
-                  out = row[w] > out ? row[w] : out;
-                }
-              }
-              top_data[ph * pooled_width_ + pw] = out;
-            }
-          }
-          bottom_data += height_ * width_;
-          top_data += pooled_height_ * pooled_width_;
-        }
+      for (int plane = 0; plane < images * channels_; ++plane) {
+        MaxPoolPlane(bottom_data, top_data);
+        bottom_data += height_ * width_;
+        top_data += pooled_height_ * pooled_width_;
       }
       break;
     case PoolingParameter_PoolMethod_AVE:

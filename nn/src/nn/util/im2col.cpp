@@ -26,14 +26,20 @@ void InsideColumns(int width, int width_col, int pad, int stride, int offset, in
 
 void im2col(const float* data_im, int channels, int height, int width, int ksize, int pad,
             int stride, float* data_col) {
-  const int height_col = OutputSize(height, ksize, pad, stride);
+  im2col_rows(data_im, channels, height, width, ksize, pad, stride, 0,
+              OutputSize(height, ksize, pad, stride), data_col);
+}
+
+void im2col_rows(const float* data_im, int channels, int height, int width, int ksize, int pad,
+                 int stride, int row_begin, int row_end, float* data_col) {
+  const int height_col = row_end - row_begin;
   const int width_col = OutputSize(width, ksize, pad, stride);
   // Row by row of the image, all kernel columns at once, so that each input
   // row is read from the cache ksize times rather than from memory.
   for (int c_im = 0; c_im < channels; ++c_im) {
     for (int h_offset = 0; h_offset < ksize; ++h_offset) {
       for (int h = 0; h < height_col; ++h) {
-        const int h_pad = h * stride - pad + h_offset;
+        const int h_pad = (row_begin + h) * stride - pad + h_offset;
         const float* row = data_im + (c_im * height + h_pad) * width;
         for (int w_offset = 0; w_offset < ksize; ++w_offset) {
           const int c = (c_im * ksize + h_offset) * ksize + w_offset;

@@ -44,6 +44,35 @@ TEST(ConvolutionLayerTest, GroupsSeeTheirOwnChannelsThroughPaddingAndStride) {
   std::vector<int> shape;
   ForwardOn(Conv("num_output: 1 kernel_size: 3 stride: 2"), {1, 1, 2, 2}, Ramp(4), &shape);
   EXPECT_EQ(shape, (std::vector<int>{1, 1, 1, 1}));
+
+  // A map large enough to be unfolded in several bands of rows (16 channels,
+  // kernel 5: 400 column rows of 2,700 outputs), two images, padding: every
+  // output is the sum over its own window.
+  Blob<float> wide(2, 16, 135, 180);
+  FillUniform(&wide, -1, 1);
+  OneLayer big(Conv("num_output: 3 kernel_size: 5 stride: 3 pad: 1 "
+                    "weight_filler { type: 'gaussian' std: 0.1 } bias_filler { type: 'gaussian' }"),
+               &wide);
+  ASSERT_EQ(Shape(big.out), (std::vector<int>{2, 3, 45, 60}));
+  const std::vector<float> out = big.Forward();
+  const float* w = big.layer->blobs()[0]->cpu_data();
+  for (int n = 0; n < 2; ++n) {
+    for (int o = 0; o < 3; ++o) {
+      for (int cell = 0; cell < 2700; ++cell) {
+        double sum = big.layer->blobs()[1]->cpu_data()[o];
+        for (int c = 0; c < 16; ++c) {
+          for (int i = 0; i < 25; ++i) {
+            const int y = cell / 60 * 3 - 1 + i / 5;
+            const int x = cell % 60 * 3 - 1 + i % 5;
+            if (y >= 0 && y < 135 && x >= 0 && x < 180) {
+              sum += w[(o * 16 + c) * 25 + i] * wide.cpu_data()[((n * 16 + c) * 135 + y) * 180 + x];
+            }
+          }
+        }
+        ASSERT_NEAR(out[(n * 3 + o) * 2700 + cell], sum, 1e-4) << n << " " << o << " " << cell;
+      }
+    }
+  }
 }
 
 TEST(MathFunctionsTest, Im2colUnfoldsWithZeroPaddingAndCol2imAddsBack) {
@@ -86,6 +115,28 @@ TEST(PoolingLayerTest, SizesRoundUpAndAveragesCountPadding) {
                                   "stride: 3 }", {1, 1, 1, 5}, Ramp(5))[2];
   EXPECT_EQ(outside, 0.0f);
   EXPECT_TRUE(std::signbit(outside)) << "0 divided by a negative window size";
+
+  // Max pooling of two images of two channels with NaNs among the values,
+  // after a shrink to 9 by 7, against the window-by-window maximum.
+  Blob<float> in(2, 2, 13, 11);
+  OneLayer pool("type: POOLING pooling_param { kernel_size: 3 stride: 2 }", &in);
+  in.RewriteShape(2, 2, 9, 7);
+  FillUniform(&in, -5, 5);
+  for (int i = 0; i < in.count(); i += 7) in.mutable_cpu_data()[i] = std::nanf("");
+  pool.layer->AlterInputShape(7, 9, pool.bottom, &pool.top);
+  ASSERT_EQ(Shape(pool.out), (std::vector<int>{2, 2, 4, 3}));
+  const std::vector<float> pooled = pool.Forward();
+  for (int plane = 0; plane < 4; ++plane) {
+    for (int cell = 0; cell < 12; ++cell) {
+      float expected = std::numeric_limits<float>::lowest();
+      for (int h = cell / 3 * 2; h < std::min(cell / 3 * 2 + 3, 9); ++h) {
+        for (int w = cell % 3 * 2; w < std::min(cell % 3 * 2 + 3, 7); ++w) {
+          expected = std::fmax(expected, in.cpu_data()[plane * 63 + h * 7 + w]);
+        }
+      }
+      EXPECT_EQ(pooled[plane * 12 + cell], expected) << plane << " " << cell;
+    }
+  }
 }
 
 // x (1 + s) ^ -0.75 for the sums of squares s of each cell's window; alpha
