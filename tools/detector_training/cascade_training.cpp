@@ -67,7 +67,7 @@ std::vector<StagePlan> cascadeStages() {
        {24, 2, {0.2f, 0.15f}, 10, 1, 40, 4, 0.5f}},
       {"cascades/x32Net-x32-3Scales-200", tavilib::kCalibrationNetText, Role::kCalibration, 0.0f, 0.0f, 40,
        calibration, {24, 0, {0.0f, 0.0f}, 0, 0, 0, 0, 0.0f}},
-      {"cascades/x64Net", tavilib::kStage2NetText, Role::kGrader, 0.98f, 0.71f, 7, lastGrader,
+      {"cascades/x64Net", tavilib::kStage2NetText, Role::kGrader, 0.98f, 0.55f, 7, lastGrader,
        {48, 2, {0.1f, 0.1f}, 5, 1, 40, 4, 0.6f, 4, 0.45f}},
   };
 }
