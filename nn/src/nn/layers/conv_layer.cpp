@@ -126,8 +126,12 @@ Dtype ConvolutionLayer<Dtype>::Forward_cpu(const std::vector<Blob<Dtype>*>& bott
   const Dtype* weight = this->blobs_[0]->cpu_data();
   const int width_out = (*top)[0]->width();
   const int height_out = (*top)[0]->height();
-  const int rows_per_band = BandRows(width_out, height_out, K_ * group_);
+  // A 1x1 kernel without stride or padding unfolds an image into itself: the
+  // product reads the image, in one band.
+  const bool unfolded = kernel_size_ == 1 && stride_ == 1 && pad_ == 0;
+  const int rows_per_band = unfolded ? height_out : BandRows(width_out, height_out, K_ * group_);
   for (int n = 0; n < num_; ++n) {
+    const Dtype* bottom_image = bottom_data + bottom[0]->offset(n);
     Dtype* top_image = top_data + (*top)[0]->offset(n);
     // Band by band of output rows, so that the unfolded columns are still in
     // the cache when the product reads them; each output is the same sum.
@@ -137,11 +141,14 @@ Dtype ConvolutionLayer<Dtype>::Forward_cpu(const std::vector<Blob<Dtype>*>& bott
       // Before weights or a new size arrive, every group reads the first
       // group's slices, as the offsets (still 0) say.
       const int band_col_offset = col_offset_ == 0 ? 0 : K_ * band;
-      im2col_rows(bottom_data + bottom[0]->offset(n), channels_, height_, width_, kernel_size_,
-                  pad_, stride_, row, row + rows, col_data);
+      const Dtype* columns = unfolded ? bottom_image : col_data;
+      if (!unfolded) {
+        im2col_rows(bottom_image, channels_, height_, width_, kernel_size_, pad_, stride_, row,
+                    row + rows, col_data);
+      }
       for (int g = 0; g < group_; ++g) {
         cblas_sgemm(CblasRowMajor, CblasNoTrans, CblasNoTrans, M_, band, K_, 1.0f,
-                    weight + weight_offset_ * g, K_, col_data + band_col_offset * g, band, 0.0f,
+                    weight + weight_offset_ * g, K_, columns + band_col_offset * g, band, 0.0f,
                     top_image + top_offset_ * g + row * width_out, N_);
       }
     }

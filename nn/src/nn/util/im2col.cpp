@@ -1,11 +1,50 @@
 #include <algorithm>
-#include <cstring>
 
 #include "nn/util/math_functions.h"
+
+// TAVI_PORTABLE builds the plain loops only; they copy the same values.
+#if defined(__SSE__) && !defined(TAVI_PORTABLE)
+#define NN_SSE_ROADS 1
+#include <xmmintrin.h>
+#endif
 
 namespace nn {
 
 namespace {
+
+// to[i] = from[i * stride] for i < n. Rows of a small map are a few floats
+// long, so the copy is inline rather than a library call, and strides 2 and 3
+// (the scan's) take four floats from two or three vector loads. Those loads
+// reach past the group's last float, so they stop a group before the end: no
+// read passes from[(n - 1) * stride].
+void CopyStrided(const float* from, int stride, int n, float* to) {
+  int i = 0;
+#if defined(NN_SSE_ROADS)
+  if (stride == 1) {
+    for (; i + 4 <= n; i += 4) {
+      _mm_storeu_ps(to + i, _mm_loadu_ps(from + i));
+    }
+  } else if (stride == 2) {
+    for (; i + 5 <= n; i += 4) {
+      const __m128 a = _mm_loadu_ps(from + 2 * i);
+      const __m128 b = _mm_loadu_ps(from + 2 * i + 4);
+      _mm_storeu_ps(to + i, _mm_shuffle_ps(a, b, _MM_SHUFFLE(2, 0, 2, 0)));
+    }
+  } else if (stride == 3) {
+    for (; i + 5 <= n; i += 4) {
+      const float* f = from + 3 * i;
+      const __m128 a = _mm_loadu_ps(f);      // 0 1 2 3
+      const __m128 b = _mm_loadu_ps(f + 4);  // 4 5 6 7
+      const __m128 c = _mm_loadu_ps(f + 8);  // 8 9 10 11
+      const __m128 bc = _mm_shuffle_ps(b, c, _MM_SHUFFLE(1, 1, 2, 2));  // 6 6 9 9
+      _mm_storeu_ps(to + i, _mm_shuffle_ps(a, bc, _MM_SHUFFLE(2, 0, 3, 0)));
+    }
+  }
+#endif
+  for (; i < n; ++i) {
+    to[i] = from[i * stride];
+  }
+}
 
 int OutputSize(int size, int ksize, int pad, int stride) {
   return (size + 2 * pad - ksize) / stride + 1;
@@ -34,32 +73,37 @@ void im2col_rows(const float* data_im, int channels, int height, int width, int 
                  int stride, int row_begin, int row_end, float* data_col) {
   const int height_col = row_end - row_begin;
   const int width_col = OutputSize(width, ksize, pad, stride);
-  // Row by row of the image, all kernel columns at once, so that each input
-  // row is read from the cache ksize times rather than from memory.
   for (int c_im = 0; c_im < channels; ++c_im) {
     for (int h_offset = 0; h_offset < ksize; ++h_offset) {
-      for (int h = 0; h < height_col; ++h) {
-        const int h_pad = (row_begin + h) * stride - pad + h_offset;
-        const float* row = data_im + (c_im * height + h_pad) * width;
-        for (int w_offset = 0; w_offset < ksize; ++w_offset) {
-          const int c = (c_im * ksize + h_offset) * ksize + w_offset;
-          float* out = data_col + (c * height_col + h) * width_col;
+      for (int w_offset = 0; w_offset < ksize; ++w_offset) {
+        const int c = (c_im * ksize + h_offset) * ksize + w_offset;
+        float* rows = data_col + c * height_col * width_col;
+        // Kernel column w_offset reads at output column w the pixel that
+        // w_offset - stride reads at w + 1: its row is that row moved by one,
+        // and only its last cell is new. Copying is cheaper than a strided
+        // gather.
+        const float* earlier =
+            stride > 1 && w_offset >= stride ? rows - stride * height_col * width_col : nullptr;
+        int first = 0;
+        int last = 0;
+        InsideColumns(width, width_col, pad, stride, w_offset, &first, &last);
+        const int shift = w_offset - pad;
+        for (int h = 0; h < height_col; ++h) {
+          const int h_pad = (row_begin + h) * stride - pad + h_offset;
+          float* out = rows + h * width_col;
           if (h_pad < 0 || h_pad >= height) {
             std::fill(out, out + width_col, 0.0f);
             continue;
           }
-          int first = 0;
-          int last = 0;
-          InsideColumns(width, width_col, pad, stride, w_offset, &first, &last);
-          const int shift = w_offset - pad;
-          std::fill(out, out + first, 0.0f);
-          if (stride == 1) {
-            std::memcpy(out + first, row + first + shift, sizeof(float) * (last - first));
-          } else {
-            for (int w = first; w < last; ++w) {
-              out[w] = row[w * stride + shift];
-            }
+          const float* row = data_im + (c_im * height + h_pad) * width;
+          if (earlier != nullptr && width_col > 0) {
+            CopyStrided(earlier + h * width_col + 1, 1, width_col - 1, out);
+            const int w = width_col - 1;
+            out[w] = w >= first && w < last ? row[w * stride + shift] : 0.0f;
+            continue;
           }
+          std::fill(out, out + first, 0.0f);
+          CopyStrided(row + first * stride + shift, stride, last - first, out + first);
           std::fill(out + last, out + width_col, 0.0f);
         }
       }

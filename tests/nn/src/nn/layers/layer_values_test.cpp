@@ -40,6 +40,17 @@ TEST(ConvolutionLayerTest, GroupsSeeTheirOwnChannelsThroughPaddingAndStride) {
                            "weight_filler { type: 'constant' value: 1 }"),
                       {1, 1, 3, 3}, std::vector<float>(9, 1)),
             (std::vector<float>{4, 6, 4, 6, 9, 6, 4, 6, 4}));
+  // A 1x1 kernel multiplies the image where it lies: each group its own
+  // channels, or, while the offsets are still 0, every group the first
+  // group's slices of the image and of the output.
+  Blob<float> four(1, 4, 1, 2);
+  SetValues(&four, {1, 2, 10, 20, 100, 200, 1000, 2000});
+  OneLayer pointwise(Conv("num_output: 2 kernel_size: 1 group: 2 bias_term: false "
+                          "weight_filler { type: 'constant' value: 3 }"),
+                     &four);
+  EXPECT_EQ(pointwise.Forward(), (std::vector<float>{33, 66, 0, 0}));
+  pointwise.layer->UpdateOffsets();
+  EXPECT_EQ(pointwise.Forward(), (std::vector<float>{33, 66, 3300, 6600}));
   // A bottom smaller than the kernel: (2 - 3) / 2 + 1 truncates to 1.
   std::vector<int> shape;
   ForwardOn(Conv("num_output: 1 kernel_size: 3 stride: 2"), {1, 1, 2, 2}, Ramp(4), &shape);
@@ -85,6 +96,32 @@ TEST(MathFunctionsTest, Im2colUnfoldsWithZeroPaddingAndCol2imAddsBack) {
   std::vector<float> back(4, 42.0f);
   col2im(col.data(), 1, 2, 2, 2, 1, 2, back.data());
   EXPECT_EQ(back, image) << "the image is cleared first and padding cells skipped";
+
+  // Every cell against its definition, for the strides, kernels, paddings and
+  // odd widths whose rows are copied, gathered or taken from a neighbour row.
+  for (int stride = 1; stride <= 3; ++stride) {
+    for (int ksize = 1; ksize <= 5; ++ksize) {
+      for (int pad = 0; pad <= 2; ++pad) {
+        const int height = 9;
+        const int width = 7 + 4 * stride;
+        const std::vector<float> ramp = Ramp(2 * height * width);
+        const int height_col = (height + 2 * pad - ksize) / stride + 1;
+        const int width_col = (width + 2 * pad - ksize) / stride + 1;
+        std::vector<float> cols(2 * ksize * ksize * height_col * width_col, -7.0f);
+        im2col(ramp.data(), 2, height, width, ksize, pad, stride, cols.data());
+        for (size_t i = 0; i < cols.size(); ++i) {
+          const int w = i % width_col;
+          const int h = i / width_col % height_col;
+          const int c = i / width_col / height_col;
+          const int y = h * stride - pad + c / ksize % ksize;
+          const int x = w * stride - pad + c % ksize;
+          const bool inside = y >= 0 && y < height && x >= 0 && x < width;
+          ASSERT_EQ(cols[i], inside ? ramp[(c / ksize / ksize * height + y) * width + x] : 0.0f)
+              << stride << " " << ksize << " " << pad << " " << i;
+        }
+      }
+    }
+  }
 
   // Applied to ones, col2im(im2col(.)) counts the windows covering each pixel.
   std::vector<float> ones(16, 1.0f);
