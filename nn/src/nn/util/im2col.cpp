@@ -1,4 +1,5 @@
 #include <algorithm>
+#include <cstring>
 
 #include "nn/util/math_functions.h"
 
@@ -12,19 +13,17 @@ namespace nn {
 
 namespace {
 
-// to[i] = from[i * stride] for i < n. Rows of a small map are a few floats
-// long, so the copy is inline rather than a library call, and strides 2 and 3
-// (the scan's) take four floats from two or three vector loads. Those loads
-// reach past the group's last float, so they stop a group before the end: no
-// read passes from[(n - 1) * stride].
+// to[i] = from[i * stride] for i < n. Strides 2 and 3 (the scan's) take four
+// floats from two or three vector loads; as those reach past the group's last
+// float, they stop a group before the end: no read passes from[(n - 1) * stride].
 void CopyStrided(const float* from, int stride, int n, float* to) {
+  if (stride == 1) {
+    std::memcpy(to, from, sizeof(float) * std::max(n, 0));
+    return;
+  }
   int i = 0;
 #if defined(NN_SSE_ROADS)
-  if (stride == 1) {
-    for (; i + 4 <= n; i += 4) {
-      _mm_storeu_ps(to + i, _mm_loadu_ps(from + i));
-    }
-  } else if (stride == 2) {
+  if (stride == 2) {
     for (; i + 5 <= n; i += 4) {
       const __m128 a = _mm_loadu_ps(from + 2 * i);
       const __m128 b = _mm_loadu_ps(from + 2 * i + 4);
