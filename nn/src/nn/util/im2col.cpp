@@ -13,9 +13,10 @@ namespace nn {
 
 namespace {
 
-// to[i] = from[i * stride] for i < n. Strides 2 and 3 (the scan's) take four
-// floats from two or three vector loads; as those reach past the group's last
-// float, they stop a group before the end: no read passes from[(n - 1) * stride].
+// to[i] = from[i * stride] for i < n. Strides 2 and 3 (the scan's is 3) take
+// four floats from two or three vector loads; as those reach past the group's
+// last float, they stop a group before the end: no read passes
+// from[(n - 1) * stride].
 void CopyStrided(const float* from, int stride, int n, float* to) {
   if (stride == 1) {
     std::memcpy(to, from, sizeof(float) * std::max(n, 0));
